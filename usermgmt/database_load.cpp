@@ -1,0 +1,255 @@
+// usermgmt/database_load.cpp: building the databases from the account files.
+#include <grp.h>
+#include <pwd.h>
+#include <shadow.h>
+#include <syslog.h>
+
+#include "usermgmt/account_types.h"
+#include "usermgmt/context.h"
+#include "usermgmt/database.h"
+#include "usermgmt/usermgmt.h"
+
+static constexpr gint64 SECONDS_PER_DAY = 86400;
+
+// What the passwd file holds when the password lives in the shadow file.
+static constexpr const char *password_elsewhere = "x";
+
+static guint count_of(const core_file_data &cached) {
+    return cached.data != nullptr ? cached.data->len : 0;
+}
+
+static const char *text_of(const GError *error) {
+    return error != nullptr ? error->message : "Unknown error";
+}
+
+static internal_group *internal_group_from_linux_group(const struct group *line, GError **error) {
+    const guint32 type = group_type_of_gid(line->gr_gid);
+    if (type == GROUP_TYPE_NONE) {
+        g_set_error(error, USERMGMT_ERROR, USERMGMT_ERROR_GROUP, "unable to determine group type");
+        return nullptr;
+    }
+
+    auto *group = g_new0(internal_group, 1);
+    group->type = type;
+    group->name = g_strdup(line->gr_name);
+    if (line->gr_passwd != nullptr && *line->gr_passwd != '\0')
+        group->password = g_strdup(line->gr_passwd);
+    group->gid = line->gr_gid;
+    group->members = member_set_new();
+    for (char **member = line->gr_mem; member != nullptr && *member != nullptr; member++)
+        add_user_to_group(group, *member, nullptr);
+    return group;
+}
+
+// Adds one parsed group or skips it. False where that is fatal.
+static bool load_group(const usermgmt_ctx *ctx, group_database *group_db, const struct group *line,
+                       GError **error) {
+    const bool strict = (ctx->open_flags & USERMGMT_OPEN_STRICT) != 0;
+
+    if (group_database_find(group_db, line->gr_name) != nullptr) {
+        if (strict) {
+            g_set_error(error, USERMGMT_ERROR, USERMGMT_ERROR_DUPLICATE_GROUP,
+                        "group data contains duplicate entry '%s'", line->gr_name);
+            return false;
+        }
+        syslog(LOG_WARNING, "Skipping duplicate group entry '%s'", line->gr_name);
+        return true;
+    }
+
+    g_autoptr(GError) cause = nullptr;
+    internal_group *group = internal_group_from_linux_group(line, &cause);
+    if (group != nullptr) {
+        group_database_add(group_db, group);
+        return true;
+    }
+    if (strict) {
+        g_propagate_prefixed_error(error, g_steal_pointer(&cause),
+                                   "could not parse group data for '%s': ", line->gr_name);
+        return false;
+    }
+    syslog(LOG_ERR, "Failed to parse group '%s': %s", line->gr_name, text_of(cause));
+    return true;
+}
+
+gboolean init_populate_group_database(const usermgmt_ctx *ctx, group_database *group_db,
+                                      GError **error) {
+    if (group_db->entries->len != 0 || g_hash_table_size(group_db->name_hash) != 0 ||
+        g_hash_table_size(group_db->gid_hash) != 0) {
+        g_set_error(error, USERMGMT_ERROR, USERMGMT_ERROR_INTERNAL,
+                    "failed to init internal structures");
+        return FALSE;
+    }
+
+    const core_file_data &cached = ctx->cached[CORE_FILE_ROW_GROUP];
+    if (cached.data == nullptr)
+        return TRUE;
+    for (const struct group *line : records<const struct group>(cached.data)) {
+        if (!load_group(ctx, group_db, line, error)) {
+            g_prefix_error(error, "Could not init group database, ");
+            return FALSE;
+        }
+    }
+    return TRUE;
+}
+
+gboolean group_database_init(usermgmt_ctx *ctx, gboolean reread, GError **error) {
+    const core_file_data &cached = ctx->cached[CORE_FILE_ROW_GROUP];
+    const bool read_again = reread || cached.data == nullptr;
+    const guint32 mask = read_again ? guint32{CORE_FILE_GROUP} : 0;
+    core_file_free_data(ctx, mask);
+    if (!core_file_parse(ctx, mask, error)) {
+        g_prefix_error(error, "Could not init group database, ");
+        return FALSE;
+    }
+
+    group_database group_db = group_database_new(count_of(cached));
+    if (!init_populate_group_database(ctx, &group_db, error)) {
+        group_database_clear(&group_db);
+        return FALSE;
+    }
+    group_database_clear(&ctx->group_db);
+    ctx->group_db = group_db;
+    ctx->group_db.dirty = FALSE;
+    return TRUE;
+}
+
+// The GIDs that exist: the group database's own index, or without one the parsed groups.
+static GHashTable *gid_index(const usermgmt_ctx *ctx) {
+    if (ctx->group_db.gid_hash != nullptr)
+        return g_hash_table_ref(ctx->group_db.gid_hash);
+
+    GHashTable *index = g_hash_table_new(g_int_hash, g_int_equal);
+    const core_file_data &cached = ctx->cached[CORE_FILE_ROW_GROUP];
+    if (cached.data != nullptr)
+        for (struct group *line : records<struct group>(cached.data))
+            (void)g_hash_table_add(index, &line->gr_gid);
+    return index;
+}
+
+// Name -> struct spwd, both borrowed; null without a shadow file. The first line of a name counts.
+static GHashTable *shadow_index(const usermgmt_ctx *ctx) {
+    const core_file_data &cached = ctx->cached[CORE_FILE_ROW_SHADOW];
+    if (cached.data == nullptr)
+        return nullptr;
+
+    GHashTable *index = g_hash_table_new(g_str_hash, g_str_equal);
+    for (struct spwd *line : records<struct spwd>(cached.data))
+        if (!g_hash_table_contains(index, line->sp_namp))
+            (void)g_hash_table_insert(index, line->sp_namp, line);
+    return index;
+}
+
+static const struct spwd *find_shadow(GHashTable *shadow, const char *name) {
+    if (shadow == nullptr)
+        return nullptr;
+    return static_cast<const struct spwd *>(g_hash_table_lookup(shadow, name));
+}
+
+static internal_user *internal_user_from_linux_passwd(const struct passwd *line, GHashTable *shadow,
+                                                      GHashTable *gids, GError **error) {
+    const bool shadowed = g_strcmp0(line->pw_passwd, password_elsewhere) == 0;
+    const struct spwd *shadow_line = shadowed ? find_shadow(shadow, line->pw_name) : nullptr;
+    if (shadowed && shadow_line == nullptr) {
+        g_set_error(error, USERMGMT_ERROR, USERMGMT_ERROR_USER,
+                    "no corresponding shadow entry was found for '%s'", line->pw_name);
+        return nullptr;
+    }
+    if (!g_hash_table_contains(gids, &line->pw_gid)) {
+        g_set_error(error, USERMGMT_ERROR, USERMGMT_ERROR_GROUP,
+                    "no group was found on the system for GID '%d'",
+                    static_cast<int>(line->pw_gid));
+        return nullptr;
+    }
+    const guint32 type = user_type_of_uid(line->pw_uid);
+    if (type == USER_TYPE_NONE) {
+        g_set_error(error, USERMGMT_ERROR, USERMGMT_ERROR_USER_TYPE,
+                    "user type for %s could not be determined!", line->pw_name);
+        return nullptr;
+    }
+
+    auto *user = g_new0(internal_user, 1);
+    user->type = type;
+    user->shadowed = shadowed;
+    user->name = g_strdup(line->pw_name);
+    user->password = g_strdup(shadowed ? shadow_line->sp_pwdp : line->pw_passwd);
+    user->gecos = g_strdup(line->pw_gecos);
+    user->home = g_strdup(line->pw_dir);
+    user->shell = g_strdup(line->pw_shell);
+    user->uid = line->pw_uid;
+    user->gid = line->pw_gid;
+    if (shadowed)
+        user->last_change = gint64{shadow_line->sp_lstchg} * SECONDS_PER_DAY;
+    return user;
+}
+
+gboolean init_populate_user_database(const usermgmt_ctx *ctx, user_database *user_db,
+                                     GError **error) {
+    if (user_db->entries->len != 0 || g_hash_table_size(user_db->name_hash) != 0) {
+        g_set_error(error, USERMGMT_ERROR, USERMGMT_ERROR_INTERNAL,
+                    "could not allocate internal structures");
+        return FALSE;
+    }
+
+    const core_file_data &cached = ctx->cached[CORE_FILE_ROW_PASSWD];
+    if (cached.data == nullptr)
+        return TRUE;
+    g_autoptr(GHashTable) gids = gid_index(ctx);
+    g_autoptr(GHashTable) shadow = shadow_index(ctx);
+    for (const struct passwd *line : records<const struct passwd>(cached.data)) {
+        g_autoptr(GError) cause = nullptr;
+        internal_user *user = internal_user_from_linux_passwd(line, shadow, gids, &cause);
+        if (user != nullptr) {
+            user_database_add(user_db, user);
+            continue;
+        }
+        syslog(LOG_WARNING, "Failed to parse user '%s': %s", line->pw_name, text_of(cause));
+        if ((ctx->open_flags & USERMGMT_OPEN_STRICT) != 0) {
+            g_propagate_prefixed_error(error, g_steal_pointer(&cause),
+                                       "could not parse user %s as ", line->pw_name);
+            return FALSE;
+        }
+    }
+    return TRUE;
+}
+
+// A later account of that name would silently be a member, so the administrator is told.
+static void warn_of_unknown_members(const usermgmt_ctx *ctx) {
+    for (const internal_group *group : records<const internal_group>(ctx->group_db.entries)) {
+        GHashTableIter iter;
+        gpointer member;
+        g_hash_table_iter_init(&iter, group->members);
+        while (g_hash_table_iter_next(&iter, &member, nullptr)) {
+            const auto *name = static_cast<const char *>(member);
+            if (user_database_find(&ctx->user_db, name) == nullptr)
+                syslog(LOG_WARNING, "Group '%s' lists member '%s', which is no known user",
+                       group->name, name);
+        }
+    }
+}
+
+gboolean user_database_init(usermgmt_ctx *ctx, GError **error) {
+    guint32 mask = 0;
+    if (ctx->cached[CORE_FILE_ROW_PASSWD].data == nullptr)
+        mask |= CORE_FILE_PASSWD;
+    if (ctx->has_shadow && ctx->cached[CORE_FILE_ROW_SHADOW].data == nullptr)
+        mask |= CORE_FILE_SHADOW;
+    if (ctx->cached[CORE_FILE_ROW_GROUP].data == nullptr)
+        mask |= CORE_FILE_GROUP;
+    core_file_free_data(ctx, mask);
+    if (!core_file_parse(ctx, mask, error)) {
+        g_prefix_error(error, "Could not init user database, ");
+        return FALSE;
+    }
+
+    user_database user_db = user_database_new(count_of(ctx->cached[CORE_FILE_ROW_PASSWD]));
+    if (!init_populate_user_database(ctx, &user_db, error)) {
+        user_database_clear(&user_db);
+        return FALSE;
+    }
+    user_database_clear(&ctx->user_db);
+    ctx->user_db = user_db;
+    ctx->user_db.dirty = FALSE;
+    if (ctx->group_db.entries != nullptr)
+        warn_of_unknown_members(ctx);
+    return TRUE;
+}
