@@ -1,0 +1,46 @@
+// service/reply.cpp: what may go out on the bus.
+#include "service/reply.h"
+
+#include <cstring>
+
+// dbus-daemon's default max_message_size for the system bus, dbus-daemon(1), and room for the
+// header.
+static constexpr gsize MESSAGE_LIMIT = 32 * 1024 * 1024;
+static constexpr gsize HEADER_ROOM = 64 * 1024;
+
+// The D-Bus wire format: a length, a terminator, and padding to the next length's boundary.
+static constexpr gsize LENGTH_SIZE = 4;
+static constexpr gsize TERMINATOR_SIZE = 1;
+static constexpr gsize MAX_PADDING = 3;
+static constexpr gsize STRING_OVERHEAD = LENGTH_SIZE + TERMINATOR_SIZE + MAX_PADDING;
+
+char *sendable_text(const char *text) {
+    return text != nullptr ? g_utf8_make_valid(text, -1) : g_strdup("");
+}
+
+char **sendable_list(const char *const *list) {
+    const guint length = g_strv_length(const_cast<char **>(list));
+    char **sendable = g_new0(char *, length + 1);
+    for (guint i = 0; i < length; i++)
+        sendable[i] = sendable_text(list[i]);
+    return sendable;
+}
+
+gsize wire_size(const char *text) {
+    return std::strlen(text) + STRING_OVERHEAD;
+}
+
+gsize wire_size(const char *const *list) {
+    gsize size = LENGTH_SIZE;
+    for (; *list != nullptr; list++)
+        size += wire_size(*list);
+    return size;
+}
+
+bool check_reply_size(gsize size, GError **error) {
+    if (size <= MESSAGE_LIMIT - HEADER_ROOM)
+        return true;
+    g_set_error(error, G_FILE_ERROR, G_FILE_ERROR_FAILED,
+                "The reply of %" G_GSIZE_FORMAT " bytes is larger than a bus message may be", size);
+    return false;
+}
