@@ -5,10 +5,10 @@
 // Each round makes CALLS of every kind, the kinds in turn, so that a machine whose speed drifts
 // treats them alike. Prints a line a kind: its name, then the round's microseconds a call, ROUNDS
 // times.
-#include <algorithm>
 #include <cstdio>
 #include <cstdlib>
-#include <span>
+#include <iterator>
+#include <vector>
 
 #include <gio/gio.h>
 
@@ -62,14 +62,15 @@ int main(int argc, char **argv) {
 
     for (const call_kind &kind : call_kinds)
         (void)microseconds_a_call(bus, kind, calls);  // a warm-up that does not count
-    g_autoptr(GString) lines[std::size(call_kinds)] = {};
-    for (std::size_t k = 0; k < std::size(call_kinds); k++)
-        lines[k] = g_string_new(call_kinds[k].name);
+    std::vector<double> measured[std::size(call_kinds)];
     for (int round = 0; round < rounds; round++)
         for (std::size_t k = 0; k < std::size(call_kinds); k++)
-            g_string_append_printf(lines[k], " %.2f",
-                                   microseconds_a_call(bus, call_kinds[k], calls));
-    for (const GString *line : lines)
-        (void)puts(line->str);
+            measured[k].push_back(microseconds_a_call(bus, call_kinds[k], calls));
+    for (std::size_t k = 0; k < std::size(call_kinds); k++) {
+        (void)printf("%s", call_kinds[k].name);
+        for (const double microseconds : measured[k])
+            (void)printf(" %.2f", microseconds);
+        (void)puts("");
+    }
     return EXIT_SUCCESS;
 }
