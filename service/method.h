@@ -70,7 +70,7 @@ struct served_method<authorization, work> {
 
     static void connect(const char *signal, ServiceState *state) {
         g_signal_connect_data(state->skeleton, signal, G_CALLBACK(serve), state, nullptr,
-                              GConnectFlags(0));
+                              static_cast<GConnectFlags>(0));
     }
 };
 
