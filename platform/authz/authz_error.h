@@ -1,0 +1,12 @@
+// platform/authz/authz_error.h: how the library's own sources set its errors; internal.
+#pragma once
+
+#include <glib.h>
+
+#include "platform/authz/authz.h"
+
+// The domain is never registered with GDBus: over the bus a caller sees its name and the code.
+#define AUTHZ_ERROR_DOMAIN g_quark_from_string("authz")
+
+// Polkit's name on the bus, the service that decides.
+static constexpr const char *POLKIT_NAME = "org.freedesktop.PolicyKit1";
