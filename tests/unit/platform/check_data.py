@@ -1,0 +1,170 @@
+#!/usr/bin/python3
+# tests/unit/platform/check_data.py: what data/ says to polkit, the message bus and systemd:
+# check_data.py DATA_FOLDER GENERATED_UNIT INTERFACE_XML
+import configparser
+import pathlib
+import re
+import subprocess
+import sys
+import tempfile
+import unittest
+import xml.etree.ElementTree as ET
+
+DATA, UNIT, INTERFACE = (pathlib.Path(argument) for argument in sys.argv[1:4])
+NAME = "com.zintor.PrivaneSystem"
+PREFIX = "com.zintor.privane-system."
+UNIT_METHODS = {"StartService", "StopService", "RestartService", "ReloadService", "SetDefaultTarget"}
+VIEWER_ACTIONS = {"checkgroup", "checkuser", "getgroup", "getgrouplist", "getgrouplistfull", "getuser",
+                  "getuserlist"}
+ROOT_ACTIONS = {"addbootblockparam", "adduser", "chpasswduser", "modifyuser", "pinsrv", "readlogfile"}
+
+
+def fixed_actions():
+    """The actions of the interface's methods, but for those that a unit's name is part of."""
+    methods = {method.get("name") for method in ET.parse(INTERFACE).iter("method")}
+    actions = {name.lower() for name in methods - UNIT_METHODS}
+    actions -= {"addsystemuser", "getactivenetworkinfo"}
+    return actions | {"getactivenetworkinfo.all", "getactivenetworkinfo.tcp-udp"}
+
+
+def read_ini(path):
+    parser = configparser.ConfigParser(strict=True, interpolation=None)
+    parser.optionxform = str
+    with open(path, encoding="utf-8") as file:
+        parser.read_file(file)
+    return parser
+
+
+class PolkitPolicy(unittest.TestCase):
+    def setUp(self):
+        self.actions = ET.parse(DATA / "com.zintor.privane-system.policy").getroot().findall("action")
+
+    def test_each_fixed_action_is_declared_once(self):
+        declared = [action.get("id") for action in self.actions]
+        self.assertEqual(len(declared), 41)
+        self.assertEqual(sorted(declared), sorted(PREFIX + name for name in fixed_actions()))
+
+    def test_all_are_refused_by_default(self):
+        for action in self.actions:
+            defaults = {entry.tag: entry.text for entry in action.find("defaults")}
+            self.assertEqual(defaults, {"allow_any": "no", "allow_inactive": "no", "allow_active": "no"},
+                             action.get("id"))
+
+    def test_all_say_what_they_are(self):
+        texts = [action.findtext("description") for action in self.actions]
+        self.assertEqual(len(set(texts)), len(texts))
+        for action in self.actions:
+            self.assertEqual([entry.tag for entry in action], ["description", "message", "defaults"])
+            self.assertRegex(action.findtext("description"), r"^[A-Z].*[^. ]$")
+            self.assertRegex(action.findtext("message"), r"^Authorization is required for .*[^. ]\.$")
+
+
+class ExampleRules(unittest.TestCase):
+    def granted(self, role):
+        text = (DATA / "examples" / f"60-privane-{role}.rules").read_text(encoding="utf-8")
+        self.assertIn(f'subject.isInGroup("privane-{role}")', text)
+        listed = re.search(r"var granted = \[(.*?)\];", text, re.DOTALL).group(1)
+        names = re.findall(r'"([^"]*)"', listed)
+        self.assertEqual(names, sorted(set(names)))
+        return set(names), text
+
+    def test_viewer_holds_the_account_queries(self):
+        names, _ = self.granted("viewer")
+        self.assertEqual(names, VIEWER_ACTIONS)
+
+    def test_operator_holds_declared_actions(self):
+        names, _ = self.granted("operator")
+        self.assertGreater(len(names), 0)
+        self.assertLessEqual(names, fixed_actions())
+
+    def test_what_amounts_to_root_is_named_and_not_granted(self):
+        viewer, _ = self.granted("viewer")
+        operator, text = self.granted("operator")
+        self.assertFalse(ROOT_ACTIONS & (viewer | operator))
+        comment = "\n".join(line for line in text.splitlines() if line.startswith("//"))
+        for name in ROOT_ACTIONS:
+            self.assertIn(name, comment)
+
+    def test_sysusers_makes_their_groups(self):
+        lines = (DATA / "examples" / "privane-roles.sysusers.conf").read_text(encoding="utf-8").splitlines()
+        self.assertEqual([line for line in lines if not line.startswith("#")],
+                         ["g privane-viewer -", "g privane-operator -"])
+
+
+class BusFiles(unittest.TestCase):
+    def rules_of(self, **context):
+        root = ET.parse(DATA / f"{NAME}.conf").getroot()
+        policies = [policy for policy in root if policy.attrib == context]
+        self.assertEqual(len(policies), 1, context)
+        return [(rule.tag, rule.attrib) for rule in policies[0]]
+
+    def test_only_root_owns_the_name(self):
+        self.assertIn(("deny", {"own": NAME}), self.rules_of(context="default"))
+        self.assertIn(("allow", {"own": NAME}), self.rules_of(user="root"))
+        self.assertFalse([rule for rule in self.rules_of(group="privane") if "own" in rule[1]])
+
+    def test_root_and_the_group_call_it_and_nobody_else(self):
+        call = {"send_destination": NAME}
+        hear = {"receive_sender": NAME, "receive_type": "signal"}
+        self.assertIn(("deny", call), self.rules_of(context="default"))
+        self.assertNotIn("allow", [verdict for verdict, _ in self.rules_of(context="default")])
+        for context in ({"user": "root"}, {"group": "privane"}):
+            self.assertIn(("allow", call), self.rules_of(**context))
+            self.assertIn(("allow", hear), self.rules_of(**context))
+
+    def test_there_are_no_further_policies(self):
+        self.assertEqual(len(list(ET.parse(DATA / f"{NAME}.conf").getroot())), 3)
+
+    def test_activation_goes_through_the_unit(self):
+        service = read_ini(DATA / f"{NAME}.service")["D-BUS Service"]
+        self.assertEqual(dict(service), {"Name": NAME, "Exec": "/bin/false", "User": "root",
+                                         "SystemdService": "privane-system.service"})
+
+    def test_sysusers_makes_the_group(self):
+        lines = (DATA / "privane-system.sysusers.conf").read_text(encoding="utf-8").splitlines()
+        self.assertEqual([line for line in lines if not line.startswith("#")], ["g privane -"])
+
+
+class Unit(unittest.TestCase):
+    def setUp(self):
+        self.text = UNIT.read_text(encoding="utf-8")
+
+    def value_of(self, key):
+        return re.findall(rf"^{key}=(.*)$", self.text, re.MULTILINE)
+
+    def test_systemd_accepts_every_line(self):
+        program = self.value_of("ExecStart")[0].split()[0]
+        with tempfile.TemporaryDirectory() as folder:
+            # Where the program is not installed, that would be the complaint.
+            copy = pathlib.Path(folder) / "privane-system.service"
+            copy.write_text(self.text.replace(program, "/bin/true"), encoding="utf-8")
+            result = subprocess.run(
+                ["systemd-analyze", "verify", "--man=no", "--recursive-errors=no", str(copy)],
+                capture_output=True, text=True, check=False)
+        self.assertEqual((result.returncode, result.stdout + result.stderr), (0, ""))
+
+    def test_capabilities_are_known(self):
+        # systemd passes over a wrong name in silence.
+        header = pathlib.Path("/usr/include/linux/capability.h").read_text(encoding="utf-8")
+        known = set(re.findall(r"#define (CAP_\w+)\s+\d+", header))
+        kept = set(" ".join(self.value_of("CapabilityBoundingSet")).split())
+        self.assertGreater(len(kept), 0)
+        self.assertLessEqual(kept, known)
+
+    def test_runs_the_service_in_the_foreground_under_its_name(self):
+        self.assertRegex(self.value_of("ExecStart")[0], r"^/[^@ ]*/privane_system -n$")
+        self.assertEqual(self.value_of("Type"), ["dbus"])
+        self.assertEqual(self.value_of("BusName"), [NAME])
+
+    def test_comes_back_and_leaves_what_it_started(self):
+        self.assertEqual(self.value_of("Restart"), ["always"])
+        self.assertEqual(self.value_of("KillMode"), ["process"])
+
+    def test_nothing_that_breaks_a_method_is_set(self):
+        for key in ("PrivateDevices", "PrivateNetwork", "PrivateTmp", "PrivateUsers", "ProtectClock",
+                    "ProtectHome", "ProtectProc", "ProcSubset", "UMask", "User"):
+            self.assertEqual(self.value_of(key), [], key)
+
+
+if __name__ == "__main__":
+    unittest.main(argv=sys.argv[:1])

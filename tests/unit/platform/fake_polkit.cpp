@@ -1,0 +1,160 @@
+// tests/unit/platform/fake_polkit.cpp: a polkit in a child process that answers by the action ID.
+#include <cerrno>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+#include <string>
+
+#include <fcntl.h>
+#include <sys/prctl.h>
+#include <unistd.h>
+
+#include <gio/gio.h>
+
+#include "tests/unit/platform/private_bus.h"
+
+static constexpr const char *INTERFACE_XML =
+    "<node><interface name='org.freedesktop.PolicyKit1.Authority'>"
+    "<method name='CheckAuthorization'>"
+    "<arg type='(sa{sv})' name='subject' direction='in'/>"
+    "<arg type='s' name='action_id' direction='in'/>"
+    "<arg type='a{ss}' name='details' direction='in'/>"
+    "<arg type='u' name='flags' direction='in'/>"
+    "<arg type='s' name='cancellation_id' direction='in'/>"
+    "<arg type='(bba{ss})' name='result' direction='out'/>"
+    "</method>"
+    "<method name='CancelCheckAuthorization'>"
+    "<arg type='s' name='cancellation_id' direction='in'/>"
+    "</method>"
+    "</interface></node>";
+
+struct service {
+    int ready_fd;
+    bool mortal;
+    bool was_cancelled;
+};
+
+static void answer(GDBusMethodInvocation *call, bool allowed, bool challenge) {
+    GVariantBuilder details;
+
+    g_variant_builder_init(&details, G_VARIANT_TYPE("a{ss}"));
+    g_dbus_method_invocation_return_value(
+        call, g_variant_new("((bba{ss}))", gboolean{allowed}, gboolean{challenge}, &details));
+}
+
+static void answer_with_error(GDBusMethodInvocation *call, const std::string &text) {
+    g_dbus_method_invocation_return_dbus_error(call, "org.freedesktop.PolicyKit1.Error.Failed",
+                                               text.c_str());
+}
+
+static void answer_last(GDBusConnection *bus, GDBusMethodInvocation *call) {
+    answer(call, true, false);
+    (void)g_dbus_connection_flush_sync(bus, nullptr, nullptr);
+    std::_Exit(0);
+}
+
+// Who asks for whom, and with what: "KIND NAME, N details, flags F, cancellable".
+static std::string describe(GVariant *question) {
+    const char *kind = nullptr;
+    const char *action = nullptr;
+    const char *cancellation = nullptr;
+    guint32 flags = 0;
+    g_autoptr(GVariant) identity = nullptr;
+    g_autoptr(GVariant) details = nullptr;
+    g_autofree char *name = nullptr;
+
+    g_variant_get(question, "((&s@a{sv})&s@a{ss}u&s)", &kind, &identity, &action, &details, &flags,
+                  &cancellation);
+    if (g_variant_lookup(identity, "name", "s", &name) == FALSE)
+        name = g_strdup("without a name");
+    return std::string(kind) + " " + name + ", " + std::to_string(g_variant_n_children(details)) +
+           " details, flags " + std::to_string(flags) +
+           (*cancellation != '\0' ? ", cancellable" : "");
+}
+
+static void on_question(GDBusConnection *bus, service *self, GVariant *question,
+                        GDBusMethodInvocation *call) {
+    const char *action = nullptr;
+    g_variant_get_child(question, 1, "&s", &action);
+    const std::string name = action;
+
+    if (name == "test.allowed" || (name == "test.last-question" && !self->mortal))
+        answer(call, true, false);
+    else if (name == "test.refused")
+        answer(call, false, false);
+    else if (name == "test.password")
+        answer(call, false, true);
+    else if (name == "test.undeclared")
+        answer_with_error(call, "Action test.undeclared is not registered");
+    else if (name == "test.question")
+        answer_with_error(call, describe(question));
+    else if (name == "test.cancelled")
+        answer(call, self->was_cancelled, false);
+    else if (name == "test.last-answer")
+        answer_last(bus, call);
+    else if (name == "test.last-question")
+        std::_Exit(0);
+    else if (name != "test.silent")
+        answer_with_error(call, "no such test action: " + name);
+}
+
+static void on_call(GDBusConnection *bus, const char *, const char *, const char *,
+                    const char *method, GVariant *arguments, GDBusMethodInvocation *call,
+                    void *data) {
+    service *self = static_cast<service *>(data);
+
+    if (std::strcmp(method, "CheckAuthorization") == 0) {
+        on_question(bus, self, arguments, call);
+        return;
+    }
+    self->was_cancelled = true;
+    g_dbus_method_invocation_return_value(call, nullptr);
+}
+
+static bool request_name(GDBusConnection *bus, GError **error) {
+    g_autoptr(GVariant) reply = g_dbus_connection_call_sync(
+        bus, "org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus", "RequestName",
+        g_variant_new("(su)", "org.freedesktop.PolicyKit1", guint32{0}), G_VARIANT_TYPE("(u)"),
+        G_DBUS_CALL_FLAGS_NONE, -1, nullptr, error);
+    return reply != nullptr;
+}
+
+static bool serve(service *self, GError **error) {
+    static const GDBusInterfaceVTable functions = {on_call, nullptr, nullptr, {}};
+    const auto flags =
+        static_cast<GDBusConnectionFlags>(G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_CLIENT |
+                                          G_DBUS_CONNECTION_FLAGS_MESSAGE_BUS_CONNECTION);
+    g_autoptr(GDBusNodeInfo) node = g_dbus_node_info_new_for_xml(INTERFACE_XML, error);
+    g_autoptr(GDBusConnection) bus = g_dbus_connection_new_for_address_sync(
+        g_getenv("DBUS_SYSTEM_BUS_ADDRESS"), flags, nullptr, nullptr, error);
+    g_autoptr(GMainLoop) loop = g_main_loop_new(nullptr, FALSE);
+
+    if (node == nullptr || bus == nullptr ||
+        g_dbus_connection_register_object(bus, "/org/freedesktop/PolicyKit1/Authority",
+                                          node->interfaces[0], &functions, self, nullptr,
+                                          error) == 0 ||
+        !request_name(bus, error) || write(self->ready_fd, "+", 1) != 1)
+        return false;
+    g_main_loop_run(loop);
+    return true;
+}
+
+fake_polkit::fake_polkit(end its_end) {
+    int ends[2] = {-1, -1};
+    if (pipe2(ends, O_CLOEXEC) != 0)
+        return;
+
+    process_ = fork();
+    if (process_ == 0) {
+        (void)prctl(PR_SET_PDEATHSIG, SIGKILL);
+        service self = {ends[1], its_end == end::MORTAL, false};
+        g_autoptr(GError) error = nullptr;
+        if (!serve(&self, &error))
+            g_printerr("fake polkit: %s\n", error != nullptr ? error->message : "not ready");
+        std::_Exit(1);
+    }
+    (void)close(ends[1]);
+    char byte = '\0';
+    ready_ = read(ends[0], &byte, 1) == 1;
+    (void)close(ends[0]);
+}
