@@ -1,0 +1,1 @@
+"""tests/bus/harness: what the tests of the bus ring are written with."""

@@ -1,0 +1,61 @@
+"""tests/bus/harness/fake_authz.py: the test's side of tests/fakes/authz."""
+from dataclasses import dataclass
+from pathlib import Path
+
+from harness.sandbox import fake_library
+
+DOMAIN = "fake-authz"
+CODE = 42
+
+
+@dataclass(frozen=True)
+class Check:
+    sender: str
+    action: str
+
+
+class FakeAuthz:
+    """An authorization library that allows everything until told otherwise."""
+
+    def __init__(self, directory: Path) -> None:
+        self._directory = directory
+        self._library = fake_library("authz/libauthz.so.1")
+        self.allow()
+
+    def environment(self) -> dict[str, str]:
+        return {"LD_LIBRARY_PATH": str(self._library.parent),
+                "FAKE_AUTHZ_DIRECTORY": str(self._directory)}
+
+    @property
+    def library(self) -> Path:
+        return self._library
+
+    def _answer(self, verdict: str) -> None:
+        new = self._directory / "verdict.new"
+        new.write_bytes(verdict.encode(errors="surrogateescape"))
+        new.rename(self._directory / "verdict")
+
+    def allow(self) -> None:
+        self._answer("allow")
+
+    def refuse(self, text: str, domain: str = DOMAIN, code: int = CODE) -> None:
+        self._answer(f"refuse\n{domain}\n{code}\n{text}")
+
+    def refuse_silently(self) -> None:
+        self._answer("refuse-silently")
+
+    def fail_init(self, text: str) -> None:
+        """text may hold bytes that are no UTF-8, as Python's surrogate escapes."""
+        (self._directory / "init-error").write_bytes(text.encode(errors="surrogateescape"))
+
+    def calls(self) -> list[str]:
+        """All calls since the last forget(), as the fake recorded them."""
+        record = self._directory / "calls"
+        return record.read_text().splitlines() if record.exists() else []
+
+    def checks(self) -> list[Check]:
+        words = [call.split() for call in self.calls()]
+        return [Check(*line[1:]) for line in words if line[0] == "check"]
+
+    def forget(self) -> None:
+        (self._directory / "calls").unlink(missing_ok=True)

@@ -1,0 +1,31 @@
+"""tests/bus/harness/user_process.py: makes bus calls as the user that it runs as.
+
+Reads a request a line from standard input and answers each with a line; see bus.User.
+"""
+import json
+import sys
+from typing import Any
+
+from harness.bus import Bus, BusError
+
+
+def answer(bus: Bus, request: dict[str, Any]) -> Any:
+    if request["ask"] == "name":
+        return bus.unique_name
+    if request["ask"] == "own":
+        return bus.ask_bus("RequestName", "su", request["name"], 0)[0]
+    return bus.call(request["member"], request["signature"], *request["arguments"],
+                    timeout=request["timeout"])
+
+
+def main() -> None:
+    bus = Bus()
+    for line in sys.stdin:
+        try:
+            result = {"reply": answer(bus, json.loads(line))}
+        except BusError as error:
+            result = {"error": [error.name, error.text]}
+        print(json.dumps(result), flush=True)
+
+
+main()

@@ -1,0 +1,140 @@
+"""tests/bus/test_polkit.py: the real polkitd decides, by our policy and rules."""
+import os
+import signal
+import time
+
+import pytest
+
+from harness.accounts import CLERK_UID
+from harness.bus import Bus, BusError, User, domain_error, error_of
+from harness.interface import (ACTION_PREFIX, DECLARED_ACTIONS, IMPLEMENTED, UNIT_ACTIONS,
+                               Method)
+from harness.polkit import ExampleRules, actions, check
+from harness.sandbox import polkitd_pid
+from harness.service import Service
+
+# The answers of EnumerateActions: not authorized for any session, nor for an active one.
+REFUSED_TO_ALL = (0, 0, 0)
+
+AUTHZ_REFUSED, AUTHZ_TIMED_OUT = 1, 4
+CHECK_DEADLINE = 25
+
+VIEWER_ACTIONS = {ACTION_PREFIX + name for name in (
+    "checkuser", "checkgroup", "getuser", "getuserlist", "getgroup", "getgrouplist",
+    "getgrouplistfull")}
+
+OPERATOR_ACTIONS = {ACTION_PREFIX + name for name in (
+    "adjtime", "executeethtool", "executelldpcli", "executesmartctl", "getactivenetworkinfo.all",
+    "getactivenetworkinfo.tcp-udp", "getnetworkspeedduplex", "getslabinfo", "notifytimesync",
+    "readserno", "reboot", "restartntp", "settimeofday", "startlensd", "startntp", "stoplensd",
+    "stopntp")}
+
+NONE: set[str] = set()
+
+every_declared_action = pytest.mark.parametrize("action", sorted(DECLARED_ACTIONS))
+every_implemented_method = pytest.mark.parametrize("method", IMPLEMENTED,
+                                                   ids=lambda method: method.member)
+
+
+def call(caller: Bus | User, method: Method) -> object:
+    return caller.call(method.member, method.signature, *method.arguments)
+
+
+def refusal(action: str, uid: int) -> BusError:
+    return domain_error("authz", AUTHZ_REFUSED, f"Authorization check failed: action {action} "
+                                                f"is refused to uid {uid}")
+
+
+def test_there_are_41_actions() -> None:
+    assert len(DECLARED_ACTIONS) == 41
+
+
+def test_policy_declares_the_actions_and_refuses_them_to_all(bus: Bus) -> None:
+    ours = {action: defaults for action, defaults in actions(bus).items()
+            if action.startswith(ACTION_PREFIX)}
+
+    assert ours == {action: REFUSED_TO_ALL for action in DECLARED_ACTIONS}
+
+
+@every_declared_action
+def test_action_is_refused_to_a_user_and_allowed_to_root(action: str, bus: Bus,
+                                                         clerk: User) -> None:
+    assert check(bus, clerk.unique_name, action) is False
+    assert check(bus, bus.unique_name, action) is True
+
+
+@pytest.mark.parametrize("action", [*(f"{name}.lensd" for name in UNIT_ACTIONS), "nosuchaction"])
+def test_action_that_is_not_declared_is_an_error_for_root_too(action: str, bus: Bus) -> None:
+    error = error_of(check, bus, bus.unique_name, ACTION_PREFIX + action)
+
+    assert error.name == "org.freedesktop.PolicyKit1.Error.Failed"
+    assert f"Action {ACTION_PREFIX}{action} is not registered" in error.text
+
+
+@every_implemented_method
+def test_user_is_refused_through_the_service(method: Method, real_service: Service,
+                                             clerk: User) -> None:
+    before = real_service.output()
+    expected = refusal(method.action_id, CLERK_UID)
+
+    assert error_of(call, clerk, method) == expected
+    assert real_service.output() == before + [f"warning: {expected.text}"]
+
+
+@every_implemented_method
+def test_root_is_allowed_through_the_service(method: Method, real_service: Service,
+                                             bus: Bus) -> None:
+    before = real_service.output()
+
+    call(bus, method)
+
+    assert real_service.output() == before
+
+
+@every_implemented_method
+def test_role_is_allowed_through_the_service(method: Method, real_service: Service, bus: Bus,
+                                             viewer: User, operator: User, clerk: User,
+                                             rules: ExampleRules) -> None:
+    for user, granted in ((viewer, VIEWER_ACTIONS), (operator, OPERATOR_ACTIONS), (clerk, NONE)):
+        if method.action_id in granted:
+            assert call(user, method) == call(bus, method)
+        else:
+            assert error_of(call, user, method) == refusal(method.action_id, user.uid)
+
+
+def test_example_rules_grant_a_role_its_actions_only(bus: Bus, viewer: User, operator: User,
+                                                     clerk: User, rules: ExampleRules) -> None:
+    def allowed(user: User) -> set[str]:
+        return {action for action in DECLARED_ACTIONS if check(bus, user.unique_name, action)}
+
+    assert allowed(viewer) == VIEWER_ACTIONS
+    assert allowed(operator) == OPERATOR_ACTIONS
+    assert allowed(clerk) == NONE
+
+
+def test_rules_that_go_take_their_grants_along(real_service: Service, viewer: User,
+                                               rules: ExampleRules) -> None:
+    assert viewer.call("CheckUser", "s", "root") == (True,)
+
+    rules.remove()
+
+    assert error_of(viewer.call, "CheckUser", "s", "root") == refusal(
+        ACTION_PREFIX + "checkuser", viewer.uid)
+
+
+@pytest.mark.slow
+def test_hanging_polkitd_costs_one_call_its_deadline(real_service: Service, bus: Bus) -> None:
+    assert bus.call("CheckUser", "s", "root") == (True,)
+    begin = time.monotonic()
+
+    os.kill(polkitd_pid(), signal.SIGSTOP)
+    try:
+        error = error_of(bus.call, "CheckUser", "s", "root", timeout=CHECK_DEADLINE + 10)
+    finally:
+        os.kill(polkitd_pid(), signal.SIGCONT)
+
+    assert CHECK_DEADLINE - 1 < time.monotonic() - begin < CHECK_DEADLINE + 5
+    assert error == domain_error(
+        "authz", AUTHZ_TIMED_OUT, "Authorization check failed: cannot check action "
+                                  f"{ACTION_PREFIX}checkuser: no answer in time")
+    assert bus.call("CheckUser", "s", "root") == (True,)
