@@ -96,12 +96,15 @@ static bool fail_step(sync_state *state, const char *format, ...) {
 // A leftover is unlinked and the file made anew, so that it is private from its first moment and no
 // planted link is followed.
 static bool open_temporary(sync_state *state) {
+    errno = 0;
     if (unlink(state->path) == 0 || errno == ENOENT) {
         errno = 0;
         state->fd =
             open(state->path, O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, PRIVATE_MODE);
-        if (state->fd >= 0)
+        if (state->fd >= 0) {
+            errno = 0;
             state->file = fdopen(state->fd, "w");
+        }
     }
     if (state->file == nullptr)
         return fail_step(state, "could not fopen/fileno temporary file '%s': %s", state->path,
@@ -174,6 +177,7 @@ static bool sync_directory(const char *directory) {
     const int fd = open(directory, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     if (fd < 0)
         return false;
+    errno = 0;
     const bool synced = fsync(fd) == 0;
     const int saved_errno = errno;
     (void)close(fd);  // nothing was written through it
@@ -237,17 +241,18 @@ static bool write_temporaries(std::span<const core_file> descriptors, const core
         if (!source[i].dirty)
             continue;
 
+        sync_state *state = &states[i];
         if (source[i].data == nullptr) {
             if (error == nullptr || *error == nullptr)
                 g_set_error(error, COREFILE_ERROR, COREFILE_ERROR_MISSING_DATA,
                             "missing output data for cf '%s'", descriptors[i].name);
             *failed_bare += 1;
             all_written = false;
-        } else if (!cfile_write_temp(&descriptors[i], &source[i], &states[i])) {
-            warn_unless(states[i].err != NULL);
-            GError *cause = g_steal_pointer(&states[i].err);
-            sync_state_clear(&states[i]);
-            states[i].err = cause;
+        } else if (!cfile_write_temp(&descriptors[i], &source[i], state)) {
+            warn_unless(state->err != NULL);
+            GError *cause = g_steal_pointer(&state->err);
+            sync_state_clear(state);
+            state->err = cause;
             all_written = false;
         }
     }
