@@ -1,0 +1,46 @@
+"""tests/device/conftest.py: one camera for the whole session, put back to the state after its boot
+before every test."""
+import sys
+from collections.abc import Iterator
+from pathlib import Path
+
+import pytest
+
+TREE = Path(__file__).resolve().parents[2]
+sys.path.insert(0, str(TREE / "device"))
+
+from camera.layer_cache import LayerCache  # noqa: E402  (found through the line above)
+from camera.machine import Camera  # noqa: E402
+from camera.warm_start import BOOTED, start_camera  # noqa: E402
+
+
+def pytest_addoption(parser: pytest.Parser) -> None:
+    parser.addoption("--build-dir", type=Path, default=TREE / "build",
+                     help="the built Meson folder whose service goes into the camera")
+
+
+@pytest.fixture(scope="session")
+def build_dir(request: pytest.FixtureRequest) -> Path:
+    folder: Path = request.config.getoption("--build-dir").resolve()
+    if not (folder / "build.ninja").exists():
+        pytest.fail(f"{folder} is no Meson build folder; ./test device makes it")
+    return folder
+
+
+@pytest.fixture(scope="session")
+def layer_cache(request: pytest.FixtureRequest, build_dir: Path) -> LayerCache:
+    reporter = request.config.pluginmanager.get_plugin("terminalreporter")
+    return LayerCache(build_dir / "camera", reporter.write_line)
+
+
+@pytest.fixture(scope="session")
+def session_camera(build_dir: Path, layer_cache: LayerCache) -> Iterator[Camera]:
+    with start_camera(layer_cache, build_dir) as camera:
+        yield camera
+
+
+@pytest.fixture
+def camera(session_camera: Camera) -> Camera:
+    """The camera as it was right after its boot, whatever the test before did to it."""
+    session_camera.restore(BOOTED)
+    return session_camera

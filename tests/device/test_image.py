@@ -1,0 +1,45 @@
+"""tests/device/test_image.py: what the installation left in the camera's image."""
+from camera.machine import Camera
+
+INSTALLED = (
+    "/usr/sbin/privane_system",
+    "/usr/lib/x86_64-linux-gnu/libauthz.so.1",
+    "/usr/lib/x86_64-linux-gnu/liblogbackend.so.1",
+    "/usr/lib/systemd/system/privane-system.service",
+    "/usr/lib/sysusers.d/privane-system.conf",
+    "/usr/share/dbus-1/interfaces/com.zintor.PrivaneSystem.xml",
+    "/usr/share/dbus-1/system-services/com.zintor.PrivaneSystem.service",
+    "/usr/share/dbus-1/system.d/com.zintor.PrivaneSystem.conf",
+    "/usr/share/polkit-1/actions/com.zintor.privane-system.policy",
+)
+CAMERAS_USERS = {"cam-web", "cam-viewer", "cam-other"}
+
+
+def test_installed_files_are_writable_by_root_only(camera: Camera) -> None:
+    shown = camera.run(["stat", "-L", "-c", "%n %U:%G %a", *INSTALLED]).check().out.splitlines()
+    assert [line.split()[0] for line in shown] == list(INSTALLED)
+    for line in shown:
+        _, owner, mode = line.split()
+        assert owner == "root:root" and int(mode, 8) & 0o022 == 0, line
+
+
+def test_system_accounts_have_the_ids_of_a_type(camera: Camera) -> None:
+    """A group of 1000 or more would have no type, a user another one."""
+    for path, expected in (("/etc/passwd", CAMERAS_USERS),
+                           ("/etc/group", CAMERAS_USERS | {"privane", "privane-viewer"})):
+        lines = [line.split(":") for line in camera.read_file(path).decode().splitlines()]
+        ids = {name: int(number) for name, _, number, *_ in lines}
+        assert expected <= set(ids)
+        assert all(number < 1000 for name, number in ids.items() if number != 65534)
+        assert all(0 < ids[name] for name in expected)
+
+
+def test_every_library_is_there(camera: Camera) -> None:
+    shown = camera.run(["ldd", *INSTALLED[:3]]).check().out
+    assert "libauthz.so.1 => /" in shown
+    assert "not found" not in shown
+
+
+def test_nothing_failed_at_boot(camera: Camera) -> None:
+    assert camera.run(["systemctl", "is-system-running"]).out == "running\n"
+    assert camera.run(["systemctl", "--failed", "--no-legend"]).check().out == ""
