@@ -12,7 +12,7 @@ from harness.accounts import (CLERK_UID, OPERATOR_ROLE_GID, OPERATOR_UID, STANDA
 from harness.bus import Bus, User
 from harness.fake_authz import FakeAuthz
 from harness.polkit import ExampleRules
-from harness.sandbox import require_sandbox
+from harness.sandbox import STATE, require_sandbox
 from harness.service import Service
 from harness.syslog_socket import SyslogSocket
 from harness.world import Neighbour
@@ -23,6 +23,16 @@ StartService = Callable[..., Service]
 def pytest_sessionstart() -> None:
     require_sandbox()
     process.adopt_orphans()
+
+
+def pytest_terminal_summary(terminalreporter: Any, exitstatus: int) -> None:
+    """Shows what the sandbox's daemons printed, where that may explain a failure."""
+    if exitstatus == 0:
+        return
+    for log in sorted(STATE.glob("*.log")):
+        if text := log.read_text(errors="backslashreplace"):
+            terminalreporter.section(log.name)
+            terminalreporter.write(text)
 
 
 @pytest.fixture(scope="session")

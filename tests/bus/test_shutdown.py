@@ -11,7 +11,7 @@ from harness.bus import Bus
 from harness.deadline import wait_for
 from harness.fake_authz import FakeAuthz
 from harness.sandbox import start_bus
-from harness.service import INITIALIZING, STARTING
+from harness.service import INITIALIZING, STARTING, STOP_SECONDS
 from harness.strace import Trace
 
 QUIT_SIGNALS = [signal.SIGHUP, signal.SIGINT, signal.SIGTERM]
@@ -53,7 +53,7 @@ def test_more_signals_while_quitting_are_harmless(mode: str, start: StartService
         service.kill(number)
     service.kill(signal.SIGCONT)
 
-    assert service.wait() == 0
+    assert service.wait(STOP_SECONDS) == 0
     assert authz.calls() == ["init 1", "release"]
 
 
@@ -68,7 +68,7 @@ def test_two_terminations_in_a_row_are_harmless(start: StartService, authz: Fake
     except ProcessLookupError:
         pass
 
-    assert service.wait() == 0
+    assert service.wait(STOP_SECONDS) == 0
 
 
 @pytest.mark.parametrize("number", QUIT_SIGNALS, ids=lambda number: number.name)

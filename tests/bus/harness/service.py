@@ -21,6 +21,7 @@ START_SECONDS = 30.0
 
 # A quit signal has ended the service by then.
 STOP_SECONDS = 1.0
+TRACED_STOP_SECONDS = 10.0
 
 COMM = "privane_system"
 
@@ -34,6 +35,7 @@ class Service:
                  ignored: Sequence[signal.Signals] = ()) -> None:
         require_sandbox()
         self.in_foreground = list(arguments) == ["-n"]
+        self._stop_seconds = TRACED_STOP_SECONDS if wrapper else STOP_SECONDS
         self.status: int | None = None
         self._pid: int | None = None
         self._others = process.children()
@@ -66,7 +68,7 @@ class Service:
 
     def launcher_status(self) -> int:
         """The exit status of the process that was started."""
-        return self.started.wait(5)
+        return self.started.wait(START_SECONDS)
 
     def output(self) -> list[str]:
         """The lines on standard output and standard error, in their order."""
@@ -86,8 +88,8 @@ class Service:
             return owner is not None and bus.pid_of(owner) == self.pid
         wait_for("the service's bus name", is_owner, START_SECONDS)
 
-    def wait(self, seconds: float = STOP_SECONDS) -> int:
-        """The exit status, of which there must be one in time."""
+    def wait(self, seconds: float = START_SECONDS) -> int:
+        """The exit status of a service that ends by itself."""
         wait_for("the end of the service", lambda: not self.is_running(), seconds)
         assert self.status is not None
         return self.status
@@ -96,8 +98,9 @@ class Service:
         os.kill(self.pid, number)
 
     def stop(self, number: signal.Signals = signal.SIGTERM) -> int:
+        """The exit status after a quit signal, which acts promptly."""
         self.kill(number)
-        return self.wait()
+        return self.wait(self._stop_seconds)
 
     def discard(self) -> None:
         """Ends what is left of the run."""
