@@ -28,8 +28,10 @@ void privane_return_error(GDBusMethodInvocation *invocation, GError *error) {
     g_autoptr(GError) owned = error;
     g_autofree char *text = sendable_text(owned->message);
     g_autoptr(GError) too_large = nullptr;
-    if (!check_reply_size(wire_size(text), &too_large))
-        g_dbus_method_invocation_return_gerror(invocation, too_large);
-    else
+    if (check_reply_size(wire_size(text), &too_large)) {
         g_dbus_method_invocation_return_error(invocation, owned->domain, owned->code, "%s", text);
+        return;
+    }
+    g_log(G_LOG_DOMAIN, G_LOG_LEVEL_WARNING, "%s%s", PRIVANE_LOG_PREFIX, too_large->message);
+    g_dbus_method_invocation_return_gerror(invocation, too_large);
 }

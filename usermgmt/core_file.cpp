@@ -266,6 +266,7 @@ static void rename_temporaries(std::span<const core_file> descriptors, core_file
         if (!source[i].dirty || !states[i].written)
             continue;
         const rename_result result = rename_temporary(&descriptors[i], &states[i]);
+        source[i].replaced = result != rename_result::not_renamed ? TRUE : FALSE;
         if (result == rename_result::done)
             source[i].dirty = FALSE;
         // A directory that was not synced does not stop the rest: with this file in place, the

@@ -48,6 +48,8 @@ extern const core_file core_file_table[CORE_FILE_COUNT];
 struct core_file_data {
     GPtrArray *data;  // owns its records when it came from reading
     gboolean dirty;   // the file has to be written
+    // Set by a write: the live file was replaced, also where the sync of its directory then failed.
+    gboolean replaced;
 };
 
 // Reads a whole file into data, which must be empty. On failure data stays empty.

@@ -9,7 +9,6 @@ static void free_entry(gpointer entry) {
     free_record(static_cast<record *>(entry));
 }
 
-// Unlike g_ptr_array_new_full, without room for a terminator that nobody needs.
 user_database user_database_new(guint reserved) {
     return {
         .name_hash = g_hash_table_new_full(g_str_hash, g_str_equal, g_free, nullptr),

@@ -51,6 +51,10 @@ gboolean add_user_to_groups(group_database *group_db, const char *username,
 gboolean group_database_init(usermgmt_ctx *ctx, gboolean reread, GError **error);
 gboolean user_database_init(usermgmt_ctx *ctx, GError **error);
 
+// Logs the groups that list names without a passwd line, a line a group: a later account of such a
+// name would silently be a member. To be asked while the parsed files are cached.
+void warn_of_unknown_members(const usermgmt_ctx *ctx);
+
 // The populating steps of the two: fill an empty database from the context's cached files.
 gboolean init_populate_group_database(const usermgmt_ctx *ctx, group_database *group_db,
                                       GError **error);

@@ -212,21 +212,6 @@ gboolean init_populate_user_database(const usermgmt_ctx *ctx, user_database *use
     return TRUE;
 }
 
-// A later account of that name would silently be a member, so the administrator is told.
-static void warn_of_unknown_members(const usermgmt_ctx *ctx) {
-    for (const internal_group *group : records<const internal_group>(ctx->group_db.entries)) {
-        GHashTableIter iter;
-        gpointer member;
-        g_hash_table_iter_init(&iter, group->members);
-        while (g_hash_table_iter_next(&iter, &member, nullptr)) {
-            const auto *name = static_cast<const char *>(member);
-            if (user_database_find(&ctx->user_db, name) == nullptr)
-                syslog(LOG_WARNING, "Group '%s' lists member '%s', which is no known user",
-                       group->name, name);
-        }
-    }
-}
-
 gboolean user_database_init(usermgmt_ctx *ctx, GError **error) {
     guint32 mask = 0;
     if (ctx->cached[CORE_FILE_ROW_PASSWD].data == nullptr)
@@ -249,7 +234,38 @@ gboolean user_database_init(usermgmt_ctx *ctx, GError **error) {
     user_database_clear(&ctx->user_db);
     ctx->user_db = user_db;
     ctx->user_db.dirty = FALSE;
-    if (ctx->group_db.entries != nullptr)
-        warn_of_unknown_members(ctx);
     return TRUE;
+}
+
+// The names that have a line in the passwd file, borrowed.
+static GHashTable *passwd_names(const usermgmt_ctx *ctx) {
+    GHashTable *names = g_hash_table_new(g_str_hash, g_str_equal);
+    for (const struct passwd *line :
+         records<const struct passwd>(ctx->cached[CORE_FILE_ROW_PASSWD].data))
+        (void)g_hash_table_add(names, line->pw_name);
+    return names;
+}
+
+void warn_of_unknown_members(const usermgmt_ctx *ctx) {
+    g_autoptr(GHashTable) names = passwd_names(ctx);
+    for (const internal_group *group : records<const internal_group>(ctx->group_db.entries)) {
+        const char *first = nullptr;
+        guint count = 0;
+        GHashTableIter iter;
+        gpointer member;
+        g_hash_table_iter_init(&iter, group->members);
+        while (g_hash_table_iter_next(&iter, &member, nullptr)) {
+            if (g_hash_table_contains(names, member))
+                continue;
+            first = static_cast<const char *>(member);
+            count++;
+        }
+        if (count == 1)
+            syslog(LOG_WARNING, "Group '%s' lists member '%s', which has no passwd line",
+                   group->name, first);
+        else if (count > 1)
+            syslog(LOG_WARNING,
+                   "Group '%s' lists %u members without a passwd line, '%s' among them",
+                   group->name, count, first);
+    }
 }

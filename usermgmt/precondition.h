@@ -8,7 +8,7 @@
 
 #include <glib.h>
 
-// A file's name without its ending, as a template-free compile-time string.
+// A file's name without its ending, as a compile-time string.
 template <std::size_t size>
 struct file_stem {
     char text[size];

@@ -56,6 +56,7 @@ usermgmt_ctx *usermgmt_open(guint32 flags, GError **error) {
         g_mutex_unlock(&open_lock);
         return nullptr;
     }
+    warn_of_unknown_members(ctx);
     if ((flags & USERMGMT_OPEN_NO_CACHE) != 0)
         core_file_free_data(ctx, CORE_FILE_ALL);
     ctx->initialised = TRUE;
@@ -98,15 +99,14 @@ void usermgmt_reload(usermgmt_ctx *ctx, guint32 file_mask) {
 }
 
 gboolean usermgmt_sync(usermgmt_ctx *ctx, GError **error) {
-    const core_file_data users = {ctx->user_db.entries, ctx->user_db.dirty};
-    const core_file_data groups = {ctx->group_db.entries, ctx->group_db.dirty};
+    const core_file_data users = {ctx->user_db.entries, ctx->user_db.dirty, FALSE};
+    const core_file_data groups = {ctx->group_db.entries, ctx->group_db.dirty, FALSE};
     core_file_data outgoing[CORE_FILE_COUNT] = {users, users, groups};
 
     core_file_warn_of_strangers(ctx, outgoing);
     const gboolean synced = core_file_sync_all(core_file_table, outgoing, TRUE, error);
-    const gboolean was_dirty[CORE_FILE_COUNT] = {users.dirty, users.dirty, groups.dirty};
     for (int row = 0; row < CORE_FILE_COUNT; row++)
-        if (was_dirty[row] && !outgoing[row].dirty)
+        if (outgoing[row].replaced)
             core_file_remember(ctx, row);
 
     if (!synced) {

@@ -99,7 +99,8 @@ usermgmt_ctx *usermgmt_open(guint32 flags, GError **error);
 gboolean usermgmt_close(usermgmt_ctx *ctx);
 
 // Drops changes in memory by loading the databases of the masked files (CORE_FILE_… bits of
-// core_file_cache.h) again, from the files as they were read at open. Failures go to syslog.
+// core_file_cache.h) again: from the files as they were read at open, or with
+// USERMGMT_OPEN_NO_CACHE from the live files. Failures go to syslog.
 void usermgmt_reload(usermgmt_ctx *ctx, guint32 file_mask);
 
 // Writes the files of every database that changed. On failure the error begins with

@@ -25,6 +25,12 @@ def call(method: str, *arguments: str) -> str:
                        "-m", f"{NAME}.{method}", *arguments])
 
 
+def await_rules(camera: Camera, user: str) -> None:
+    """Waits until polkit has read its new rules, which it does a moment after they appear."""
+    check = call("CheckUser", "root")
+    camera.run(f"for try in {{1..50}}; do {check} && exit; sleep 0.1; done; exit 1", user=user).check()
+
+
 def strings_in(answer: str) -> list[str]:
     """The quoted words of an answer that gdbus printed."""
     return re.findall(r"'([^']*)'", answer)
@@ -101,19 +107,21 @@ class Tour:
 
     def _show_authorization(self) -> None:
         self._chapter("Who may do what: polkit")
-        self._step(["id", "cam-web"], shows=["(privane)"],
+        self._step(["id", "cam-viewer"], shows=["(privane)", "(privane-viewer)"],
                    says="Members of group privane may talk to the service, no more than that.")
-        self._step(call("GetUserList"), user="cam-web", status=1,
+        self._step(call("GetUserList"), user="cam-viewer", status=1,
                    shows=[REFUSED, "com.zintor.privane-system.getuserlist"],
                    says="polkit was asked for the action of this method, and says no.")
+        self._camera.run(["journalctl", "--sync"]).check()
         self._step(["journalctl", "-u", UNIT, "-o", "cat", "-p", "warning..warning"],
                    shows=[REFUSED], says="Failed and refused requests are in the journal.")
         self._step(["install", "-m", "644", RULES, "/etc/polkit-1/rules.d/"],
-                   says="A packaged example: rules that give a group of the system a role.")
+                   says="A packaged example: rules that give the group privane-viewer a role.")
+        await_rules(self._camera, "cam-viewer")
         self._step(call("GetUserList"), user="cam-viewer", shows=["'root'"],
-                   says="cam-viewer is in that group: the same call is allowed,")
+                   says="The same call by the same user is allowed now,")
         self._step(call("GetUserList"), user="cam-web", status=1, shows=[REFUSED],
-                   says="while cam-web stays refused.")
+                   says="while cam-web, who has no role, stays refused.")
 
     def _show_bus_policy(self) -> None:
         self._chapter("Who may call at all: the bus")

@@ -65,7 +65,8 @@ static bool is_between(gunichar first, gunichar character, gunichar last) {
 // What could end a line, drive a terminal, or show a record in another order than it was written:
 // the controls of ASCII and Latin-1, the two separators, and the marks of writing direction.
 static bool is_unprintable(gunichar character) {
-    return g_unichar_iscntrl(character) != FALSE || is_between(0x2028, character, 0x202e) ||
+    return g_unichar_iscntrl(character) != FALSE || character == 0x061c ||
+           is_between(0x200e, character, 0x200f) || is_between(0x2028, character, 0x202e) ||
            is_between(0x2066, character, 0x2069);
 }
 

@@ -12,7 +12,7 @@ from harness.accounts import (CLERK_UID, OPERATOR_ROLE_GID, OPERATOR_UID, STANDA
 from harness.bus import Bus, User
 from harness.fake_authz import FakeAuthz
 from harness.polkit import ExampleRules
-from harness.sandbox import STATE, require_sandbox
+from harness.sandbox import STATE, polkitd_pid, require_sandbox
 from harness.service import Service
 from harness.syslog_socket import SyslogSocket
 from harness.world import Neighbour
@@ -29,6 +29,8 @@ def pytest_terminal_summary(terminalreporter: Any, exitstatus: int) -> None:
     """Shows what the sandbox's daemons printed, where that may explain a failure."""
     if exitstatus == 0:
         return
+    if not Path(f"/proc/{polkitd_pid()}").exists():
+        terminalreporter.section("polkitd ended before the tests did")
     for log in sorted(STATE.glob("*.log")):
         if text := log.read_text(errors="backslashreplace"):
             terminalreporter.section(log.name)
@@ -36,23 +38,27 @@ def pytest_terminal_summary(terminalreporter: Any, exitstatus: int) -> None:
 
 
 @pytest.fixture(scope="session")
-def bus() -> Iterator[Bus]:
+def account_files() -> AccountFiles:
+    """The account files, which hold the standard accounts between tests: the bus lets a user in only
+    when it knows the user."""
+    files = AccountFiles()
+    files.write(STANDARD_PASSWD, STANDARD_SHADOW, STANDARD_GROUP)
+    return files
+
+
+@pytest.fixture(autouse=True)
+def accounts(account_files: AccountFiles) -> Iterator[AccountFiles]:
+    """The account files, with the standard accounts at the start of the test."""
+    yield account_files
+    account_files.write(STANDARD_PASSWD, STANDARD_SHADOW, STANDARD_GROUP)
+
+
+@pytest.fixture(scope="session")
+def bus(account_files: AccountFiles) -> Iterator[Bus]:
     """A connection of root."""
     connection = Bus()
     yield connection
     connection.close()
-
-
-@pytest.fixture(scope="session")
-def account_files() -> AccountFiles:
-    return AccountFiles()
-
-
-@pytest.fixture(autouse=True)
-def accounts(account_files: AccountFiles) -> AccountFiles:
-    """The account files, with the standard accounts at the start of every test."""
-    account_files.write(STANDARD_PASSWD, STANDARD_SHADOW, STANDARD_GROUP)
-    return account_files
 
 
 @pytest.fixture

@@ -130,8 +130,8 @@ def test_member_that_is_no_user_is_told(load: Load, bus: Bus) -> None:
     told = load("alice:*:1001:0:::\n", group="root:x:0:alice,ghost\nusers:x:100:ghost\n")
 
     assert told == [
-        (LOG_WARNING, "Group 'root' lists member 'ghost', which is no known user"),
-        (LOG_WARNING, "Group 'users' lists member 'ghost', which is no known user")]
+        (LOG_WARNING, "Group 'root' lists member 'ghost', which has no passwd line"),
+        (LOG_WARNING, "Group 'users' lists member 'ghost', which has no passwd line")]
     assert sorted(bus.call("GetGroup", "s", "root")[1]) == ["alice", "ghost"]
 
 
@@ -201,7 +201,7 @@ def test_damaged_group_lines_are_passed_over(load: Load, bus: Bus) -> None:
     assert [sorted(row) for row in members] == [[], [], [], ["alice", "bob"], ["alice:more"],
                                                 ["bob"]]
     assert told == [
-        (LOG_WARNING, "Group 'more' lists member 'alice:more', which is no known user")]
+        (LOG_WARNING, "Group 'more' lists member 'alice:more', which has no passwd line")]
 
 
 def test_damaged_shadow_lines_are_passed_over(load: Load, bus: Bus) -> None:

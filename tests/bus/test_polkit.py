@@ -17,7 +17,7 @@ from harness.service import Service
 REFUSED_TO_ALL = (0, 0, 0)
 
 AUTHZ_REFUSED, AUTHZ_TIMED_OUT = 1, 4
-CHECK_DEADLINE = 25
+CHECK_DEADLINE = 20
 
 VIEWER_ACTIONS = {ACTION_PREFIX + name for name in (
     "checkuser", "checkgroup", "getuser", "getuserlist", "getgroup", "getgrouplist",

@@ -7,6 +7,7 @@ from conftest import StartService
 from harness.accounts import AccountFiles
 from harness.bus import Bus, domain_error, error_of
 from harness.fake_authz import FakeAuthz
+from harness.sandbox import fake_library
 from harness.service import Service
 
 # dbus-daemon's limit for a message, beyond which it drops the connection of the sender.
@@ -19,10 +20,10 @@ TOO_LARGE = "org.gtk.GDBus.UnmappedGError.Quark._g_2dfile_2derror_2dquark.Code24
 NAME_LENGTH = 8000
 
 # The C library's time to read a line grows with the square of its length: one of 33 MiB takes
-# minutes. So no line here is longer than this.
+# minutes. So a test with longer lines needs the fake reader.
 LINE_LENGTH = 1 << 20
 
-Start = Callable[[str, str], Service]
+Start = Callable[..., Service]
 
 
 def names(prefix: str, size: int) -> list[str]:
@@ -36,9 +37,9 @@ def start_on(accounts: AccountFiles, start: StartService, authz: FakeAuthz,
     """Starts the service on the given files, which the test must leave alive."""
     services = []
 
-    def start_service(passwd: str, group: str) -> Service:
+    def start_service(passwd: str, group: str, **environment: str) -> Service:
         accounts.write_exactly(passwd, "", group)
-        services.append(start(environment=authz.environment()))
+        services.append(start(environment={**authz.environment(), **environment}))
         services[-1].wait_registered(bus)
         return services[-1]
     yield start_service
@@ -58,6 +59,16 @@ def assert_too_large(service: Service, bus: Bus, member: str, *arguments: str) -
     assert error.text.endswith(" bytes is larger than a bus message may be")
     assert int(error.text.split()[3]) > MESSAGE_LIMIT - 128 * 1024
     assert service.output() == before + [f"warning: {error.text}"]
+
+
+def test_members_of_one_group_that_are_too_large(start_on: Start, bus: Bus) -> None:
+    group = f"root:x:0:\nusers:x:100:{','.join(names('m', 33 << 20))}\nstaff:x:50:alice\n"
+    service = start_on("", group, LD_PRELOAD=str(fake_library("long_lines/liblonglines.so")))
+
+    assert_too_large(service, bus, "GetGroup", "users")
+    assert_too_large(service, bus, "GetGroupListFull")
+    assert bus.call("GetGroupList") == (["root", "users", "staff"],)
+    assert bus.call("GetGroup", "s", "staff") == (50, ["alice"])
 
 
 def groups_of_members(size: int) -> str:

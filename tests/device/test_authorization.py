@@ -2,7 +2,7 @@
 import pytest
 from calls import QUERIES, BusError, ask
 from camera.machine import Camera
-from camera.tour import NAME, REFUSED, RULES, UNIT
+from camera.tour import NAME, REFUSED, RULES, UNIT, await_rules
 
 OWN_THE_NAME = ["gdbus", "call", "--system", "-d", "org.freedesktop.DBus",
                 "-o", "/org/freedesktop/DBus", "-m", "org.freedesktop.DBus.RequestName", NAME, "0"]
@@ -18,6 +18,7 @@ def test_members_of_the_group_are_allowed_nothing(camera: Camera, method: str) -
 
 def test_a_role_is_allowed_its_methods(camera: Camera) -> None:
     camera.run(["install", "-m", "644", RULES, "/etc/polkit-1/rules.d/"]).check()
+    await_rules(camera, "cam-viewer")
     for method, arguments in QUERIES.items():
         answer = ask(camera, method, *arguments)
         assert ask(camera, method, *arguments, user="cam-viewer") == answer

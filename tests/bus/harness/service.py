@@ -25,6 +25,9 @@ TRACED_STOP_SECONDS = 10.0
 
 COMM = "privane_system"
 
+# A folder of its own: what a service prints changes none of those that a test watches.
+OUTPUTS = Path("/tmp/service-output")
+
 
 class Service:
     """One run of the binary. The process that is started either is the service ("-n" alone) or
@@ -39,7 +42,8 @@ class Service:
         self.status: int | None = None
         self._pid: int | None = None
         self._others = process.children()
-        self._output = tempfile.NamedTemporaryFile(prefix="service-", suffix=".out")
+        OUTPUTS.mkdir(exist_ok=True)
+        self._output = tempfile.NamedTemporaryFile(dir=OUTPUTS)
         # A critical of GLib's tells a broken assumption, which ends the service here.
         surroundings = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin", "G_DEBUG": "fatal-criticals",
                         "DBUS_SYSTEM_BUS_ADDRESS": SYSTEM_BUS, **(environment or {})}

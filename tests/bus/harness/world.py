@@ -11,7 +11,7 @@ from harness.deadline import wait_for
 # Files that a method writes, and the folders in which it would make new ones.
 FILES = tuple(Path(path) for path in (
     "/etc/passwd", "/etc/shadow", "/etc/group", "/etc/apache2/digest_auth_passwd"))
-FOLDERS = tuple(Path(path) for path in ("/etc", "/etc/apache2", "/run", "/tmp", "/dev"))
+FOLDERS = tuple(Path(path) for path in ("/", "/etc", "/etc/apache2", "/run", "/tmp", "/dev"))
 
 
 @dataclass(frozen=True)
@@ -29,6 +29,15 @@ def file_state(path: Path) -> FileState | None:
     return FileState(path.read_bytes() if path.is_file() else None,
                      (seen.st_ino, seen.st_mode, seen.st_uid, seen.st_gid, seen.st_size,
                       seen.st_mtime_ns, seen.st_ctime_ns))
+
+
+# Of each entry of a folder its inode and the times of its content and its attributes.
+Entries = dict[str, tuple[int, int, int]]
+
+
+def entries(folder: Path) -> Entries:
+    seen = ((entry.name, entry.stat(follow_symlinks=False)) for entry in os.scandir(folder))
+    return {name: (stat.st_ino, stat.st_mtime_ns, stat.st_ctime_ns) for name, stat in seen}
 
 
 def last_pid() -> int:
@@ -61,11 +70,11 @@ class Neighbour:
 
 @dataclass(frozen=True)
 class World:
-    """Two of them are equal when in between no file changed, appeared or went, no process or thread
-    started in the sandbox, and no neighbour got a signal."""
+    """Two of them are equal when in between no file or folder entry changed, appeared or went, no
+    process or thread started in the sandbox, and no neighbour got a signal."""
 
     files: dict[str, FileState | None]
-    folders: dict[str, tuple[str, ...]]
+    folders: dict[str, Entries]
     signals: dict[int, frozenset[int]]
     last_pid: int
 
@@ -73,6 +82,6 @@ class World:
 def snapshot(*neighbours: Neighbour) -> World:
     return World(
         files={str(path): file_state(path) for path in FILES},
-        folders={str(path): tuple(sorted(os.listdir(path))) for path in FOLDERS if path.is_dir()},
+        folders={str(path): entries(path) for path in FOLDERS if path.is_dir()},
         signals={neighbour.pid: frozenset(neighbour.signals()) for neighbour in neighbours},
         last_pid=last_pid())

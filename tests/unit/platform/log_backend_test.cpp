@@ -122,6 +122,7 @@ static constexpr escape_case escape_cases[] = {
     {"\xe2\x80\xa7 \xe2\x80\xa8 \xe2\x80\xa9",                           "\xe2\x80\xa7 \\xE2\\x80\\xA8 \\xE2\\x80\\xA9"},
     {"\xe2\x80\xae \xe2\x80\xaf \xe2\x81\xa6 \xe2\x81\xa9 \xe2\x81\xaa",
      "\\xE2\\x80\\xAE \xe2\x80\xaf \\xE2\\x81\\xA6 \\xE2\\x81\\xA9 \xe2\x81\xaa"                                       },
+    {"\xd8\x9c \xe2\x80\x8e \xe2\x80\x8f",                               "\\xD8\\x9C \\xE2\\x80\\x8E \\xE2\\x80\\x8F"  },
     {"latin \xe9t\xe9",                                                  "latin \\xE9t\\xE9"                           },
     {"cut \xe2\x82",                                                     "cut \\xE2\\x82"                              },
     {"overlong \xc0\x8a",                                                "overlong \\xC0\\x8A"                         },

@@ -236,7 +236,7 @@ TEST_F(CoreFileRead, FailureInTheMiddleFreesWhatWasRead) {
     }) {
         fetched = freed = 0;
         failing_errno = error_number;
-        data_ = {nullptr, TRUE};
+        data_ = {nullptr, TRUE, FALSE};
         EXPECT_FALSE(core_file_read_data(&failing_file, &data_, error_.out()));
         EXPECT_EQ(error_.text(), text);
         EXPECT_EQ(data_.data, nullptr);

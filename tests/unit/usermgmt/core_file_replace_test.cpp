@@ -138,7 +138,7 @@ TEST_F(CoreFileReplace, OnlyTheDirtyFileIsTouched) {
 }
 
 TEST_F(CoreFileReplace, CleanFileNeedsNoData) {
-    data_[CORE_FILE_ROW_SHADOW] = {nullptr, FALSE};
+    data_[CORE_FILE_ROW_SHADOW] = {nullptr, FALSE, FALSE};
     EXPECT_TRUE(sync()) << error_.text();
     EXPECT_EQ(states(), (lines{"new", "old", "new"}));
 }

@@ -16,7 +16,7 @@ class CoreFileWrite : public AccountFiles {
 
     // What the file of a row holds after the array was written to it.
     std::string write_row(int row) {
-        core_file_data data = {array_, TRUE};
+        core_file_data data = {array_, TRUE, FALSE};
         error_slot error;
         EXPECT_TRUE(core_file_sync(&core_file_table[row], &data, error.out())) << error.text();
         EXPECT_FALSE(data.dirty);
@@ -175,7 +175,7 @@ TEST_F(CoreFileWrite, NamesThatWouldBreakTheLineFail) {
         g_autoptr(GPtrArray) array = g_ptr_array_new();
         g_autoptr(internal_user) user = new_user(row.user);
         g_ptr_array_add(array, user);
-        core_file_data data = {array, TRUE};
+        core_file_data data = {array, TRUE, FALSE};
         error_slot error;
         const core_file &cf = core_file_table[row.row];
         EXPECT_FALSE(core_file_sync(&cf, &data, error.out()));
@@ -195,7 +195,7 @@ TEST_F(CoreFileWrite, MemberThatWouldBecomeTwoFails) {
     g_autoptr(internal_group) bad = new_group({.name = "bad", .gid = 2, .members = {"a,b"}});
     g_ptr_array_add(array, good);
     g_ptr_array_add(array, bad);
-    core_file_data data = {array, TRUE};
+    core_file_data data = {array, TRUE, FALSE};
     error_slot error;
     EXPECT_FALSE(core_file_sync(&core_file_table[CORE_FILE_ROW_GROUP], &data, error.out()));
     EXPECT_EQ(error.text(),

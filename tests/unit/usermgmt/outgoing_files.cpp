@@ -17,9 +17,9 @@ void OutgoingFiles::SetUp() {
     g_ptr_array_add(groups_, new_group({"root", nullptr, 0, {}}));
     g_ptr_array_add(groups_, new_group({"users", nullptr, 100, {"alice"}}));
 
-    data_[CORE_FILE_ROW_PASSWD] = {users_, TRUE};
-    data_[CORE_FILE_ROW_SHADOW] = {users_, TRUE};
-    data_[CORE_FILE_ROW_GROUP] = {groups_, TRUE};
+    data_[CORE_FILE_ROW_PASSWD] = {users_, TRUE, FALSE};
+    data_[CORE_FILE_ROW_SHADOW] = {users_, TRUE, FALSE};
+    data_[CORE_FILE_ROW_GROUP] = {groups_, TRUE, FALSE};
 }
 
 void OutgoingFiles::TearDown() {

@@ -235,7 +235,7 @@ TEST_F(RoundTrip, GroupLineWithAColonTooManyStopsItsFile) {
               "corefile 101: unable to sync core files, failed to write 1/3 core file(s) group: "
               "could not write entry #1 to etc/group.tmp: Invalid argument");
     EXPECT_EQ(read("group"), "good:x:1:\ntorn:x:2:a:b\n");
-    EXPECT_EQ(take_syslog(), lines{"4 Group 'torn' lists member 'a:b', which is no known user"});
+    EXPECT_EQ(take_syslog(), lines{"4 Group 'torn' lists member 'a:b', which has no passwd line"});
 }
 
 // A text with bytes of zero in it.
