@@ -126,7 +126,9 @@ def test_error_text_that_is_too_large(member: str, service: Service, bus: Bus) -
 
     assert error.name == TOO_LARGE
     assert error.text.endswith(" bytes is larger than a bus message may be")
-    (line,) = service.output()[len(before):]
+    # What went wrong, cut, and what the caller was told instead.
+    line, answer = service.output()[len(before):]
+    assert answer == f"warning: {error.text}"
     assert line.startswith("warning: ") and "'xxxxxxxx" in line
     assert len(line) < 5000
 
