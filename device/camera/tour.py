@@ -31,6 +31,11 @@ def await_rules(camera: Camera, user: str) -> None:
     camera.run(f"for try in {{1..50}}; do {check} && exit; sleep 0.1; done; exit 1", user=user).check()
 
 
+def sync_journal(camera: Camera) -> None:
+    """Waits until the journal holds what was logged so far; its daemon may just be starting."""
+    camera.run("for try in {1..50}; do journalctl --sync && exit; sleep 0.2; done; exit 1").check()
+
+
 def strings_in(answer: str) -> list[str]:
     """The quoted words of an answer that gdbus printed."""
     return re.findall(r"'([^']*)'", answer)
@@ -112,7 +117,7 @@ class Tour:
         self._step(call("GetUserList"), user="cam-viewer", status=1,
                    shows=[REFUSED, "com.zintor.privane-system.getuserlist"],
                    says="polkit was asked for the action of this method, and says no.")
-        self._camera.run(["journalctl", "--sync"]).check()
+        sync_journal(self._camera)
         self._step(["journalctl", "-u", UNIT, "-o", "cat", "-p", "warning..warning"],
                    shows=[REFUSED], says="Failed and refused requests are in the journal.")
         self._step(["install", "-m", "644", RULES, "/etc/polkit-1/rules.d/"],

@@ -21,7 +21,10 @@ StartService = Callable[..., Service]
 
 
 def pytest_sessionstart() -> None:
-    require_sandbox()
+    try:
+        require_sandbox()
+    except RuntimeError as error:
+        pytest.exit(str(error), returncode=125)
     process.adopt_orphans()
 
 
@@ -39,8 +42,8 @@ def pytest_terminal_summary(terminalreporter: Any, exitstatus: int) -> None:
 
 @pytest.fixture(scope="session")
 def account_files() -> AccountFiles:
-    """The account files, which hold the standard accounts between tests: the bus lets a user in only
-    when it knows the user."""
+    """The account files, which hold the standard accounts between tests: the bus lets a user in
+    only when it knows the user."""
     files = AccountFiles()
     files.write(STANDARD_PASSWD, STANDARD_SHADOW, STANDARD_GROUP)
     return files

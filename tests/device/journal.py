@@ -2,13 +2,14 @@
 import json
 
 from camera.machine import Camera
+from camera.tour import sync_journal
 
 Record = tuple[int, str]  # priority and text
 
 
 def records(camera: Camera, *matches: str) -> list[Record]:
     """The records with these journal fields that the service's own process wrote, oldest first."""
-    camera.run(["journalctl", "--sync"]).check()
+    sync_journal(camera)
     shown = camera.run(["journalctl", "-o", "json", "_COMM=privane_system", *matches]).check().out
     entries = [json.loads(line) for line in shown.splitlines()]
     return [(int(entry["PRIORITY"]), entry["MESSAGE"]) for entry in entries]

@@ -105,6 +105,12 @@ def test_power_off_is_a_shutdown(build_dir: Path, layer_cache: LayerCache) -> No
         assert second.pid not in machines(layer_cache)
 
 
+def heed_signals() -> None:
+    """Whoever started the tests may have let them ignore signals, as a shell does in the background."""
+    for number in (signal.SIGINT, signal.SIGTERM, signal.SIGHUP):
+        signal.signal(number, signal.SIG_DFL)
+
+
 @pytest.mark.parametrize("number", [signal.SIGINT, signal.SIGTERM, signal.SIGHUP, signal.SIGKILL])
 def test_a_signal_leaves_no_machine(build_dir: Path, layer_cache: LayerCache,
                                     number: signal.Signals) -> None:
@@ -113,7 +119,7 @@ def test_a_signal_leaves_no_machine(build_dir: Path, layer_cache: LayerCache,
     argv = [sys.executable, "-B", "-m", "camera", "--build", build_dir, "--no-shell"]
     with subprocess.Popen(argv, env={**os.environ, "PYTHONPATH": str(DEVICE)},
                           stdin=subprocess.DEVNULL, stdout=subprocess.PIPE,
-                          stderr=subprocess.PIPE) as run:
+                          stderr=subprocess.PIPE, preexec_fn=heed_signals) as run:
         end = time.monotonic() + 60
         while not set(machines(layer_cache)) - before and time.monotonic() < end:
             time.sleep(0.05)

@@ -14,12 +14,15 @@ AUTHORITY = ("org.freedesktop.PolicyKit1", "/org/freedesktop/PolicyKit1/Authorit
 RULES = Path("/etc/polkit-1/rules.d")
 EXAMPLES = Path("/usr/share/doc/privane-system/examples")
 
+# On a busy machine; polkitd itself gives up a rule after 15 s.
+ANSWER_SECONDS = 60.0
+
 
 def check(bus: Bus, subject: str, action: str) -> bool:
     """polkitd's answer for the owner of a unique bus name; BusError where it has none."""
     arguments = GLib.Variant("((sa{sv})sa{ss}us)", (
         ("system-bus-name", {"name": GLib.Variant("s", subject)}), action, {}, 0, ""))
-    reply: Any = bus.send(*AUTHORITY, "CheckAuthorization", arguments)
+    reply: Any = bus.send(*AUTHORITY, "CheckAuthorization", arguments, timeout=ANSWER_SECONDS)
     return reply[0][0]
 
 
@@ -42,13 +45,16 @@ class ExampleRules:
 
     def install(self) -> None:
         for role in self._members:
-            shutil.copy(EXAMPLES / f"60-privane-{role}.rules", RULES)
-        wait_for("polkitd's new rules", lambda: all(self._granted()))
+            # polkitd reads a file at the first sign of it, which must show it whole.
+            new = RULES / f"60-privane-{role}.new"
+            shutil.copy(EXAMPLES / f"60-privane-{role}.rules", new)
+            new.rename(new.with_suffix(".rules"))
+        wait_for("polkitd's new rules", lambda: all(self._granted()), ANSWER_SECONDS)
 
     def remove(self) -> None:
         for role in self._members:
             (RULES / f"60-privane-{role}.rules").unlink(missing_ok=True)
-        wait_for("polkitd's old rules", lambda: not any(self._granted()))
+        wait_for("polkitd's old rules", lambda: not any(self._granted()), ANSWER_SECONDS)
 
     def _granted(self) -> list[bool]:
         return [check(self._bus, user.unique_name, self.SAMPLES[role])
