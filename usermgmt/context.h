@@ -24,3 +24,10 @@ bool context_is_usable(const usermgmt_ctx *ctx, const char *action, GError **err
 
 // USERMGMT_ERROR_ARGUMENT, "Failed to %s: Invalid or missing '%s' argument"; always false.
 bool fail_missing_argument(const char *action, const char *argument, GError **error);
+
+// The end of an operation that failed: names it and the account in front of the error, "Failed to
+// %s
+// '%s', ", and loads again what the file mask selects. Always false. The account's name must not be
+// that of a record, which may be gone then.
+bool fail_and_reload(usermgmt_ctx *ctx, const char *action, const char *name, guint32 file_mask,
+                     GError **error);

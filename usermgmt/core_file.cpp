@@ -10,6 +10,7 @@
 #include <cstdarg>
 
 #include "usermgmt/precondition.h"
+#include "usermgmt/secret.h"
 
 G_DEFINE_QUARK(corefile, corefile_error)
 
@@ -42,6 +43,8 @@ gboolean core_file_read_data(const core_file *descriptor, core_file_data *dst_da
         return FALSE;
     }
 
+    wiped_stream_buffer buffer;
+    buffer.give_to(stream);
     g_autoptr(GPtrArray) data = g_ptr_array_new_with_free_func(descriptor->free_record);
     errno = 0;
     while (gpointer record = descriptor->fetch(stream))
@@ -95,7 +98,7 @@ static bool fail_step(sync_state *state, const char *format, ...) {
 
 // A leftover is unlinked and the file made anew, so that it is private from its first moment and no
 // planted link is followed.
-static bool open_temporary(sync_state *state) {
+static bool open_temporary(sync_state *state, wiped_stream_buffer *buffer) {
     errno = 0;
     if (unlink(state->path) == 0 || errno == ENOENT) {
         errno = 0;
@@ -109,6 +112,7 @@ static bool open_temporary(sync_state *state) {
     if (state->file == nullptr)
         return fail_step(state, "could not fopen/fileno temporary file '%s': %s", state->path,
                          last_cause());
+    buffer->give_to(state->file);
     return true;
 }
 
@@ -144,7 +148,8 @@ static bool finish_temporary(sync_state *state) {
     return true;
 }
 
-static bool cfile_write_temp(const core_file *cf, const core_file_data *source, sync_state *state) {
+static bool cfile_write_temp(const core_file *cf, const core_file_data *source, sync_state *state,
+                             wiped_stream_buffer *buffer) {
     warn_unless(state->file == NULL);
     warn_unless(state->path == NULL);
     warn_unless(state->written == FALSE);
@@ -160,7 +165,7 @@ static bool cfile_write_temp(const core_file *cf, const core_file_data *source, 
         return fail_step(state, "could not stat() core file at '%s': %s", cf->path, last_cause());
 
     state->path = g_strconcat(cf->path, ".tmp", nullptr);
-    if (!open_temporary(state))
+    if (!open_temporary(state, buffer))
         return false;
     errno = 0;
     if (fchmod(state->fd, PRIVATE_MODE) != 0)
@@ -185,14 +190,14 @@ static bool sync_directory(const char *directory) {
     return synced;
 }
 
-enum class rename_result { done, not_renamed, not_synced };
+enum class rename_result { DONE, NOT_RENAMED, NOT_SYNCED };
 
 static rename_result rename_temporary(const core_file *cf, sync_state *state) {
     errno = 0;
     if (rename(state->path, cf->path) != 0) {
         fail_step(state, "%s: could not rename file '%s' -> '%s', %s", state->name, state->path,
                   cf->path, last_cause());
-        return rename_result::not_renamed;
+        return rename_result::NOT_RENAMED;
     }
 
     g_autofree char *directory = g_path_get_dirname(cf->path);
@@ -200,10 +205,10 @@ static rename_result rename_temporary(const core_file *cf, sync_state *state) {
     if (!sync_directory(directory)) {
         fail_step(state, "%s: could not open/sync directory '%s/', %s", state->name, directory,
                   last_cause());
-        return rename_result::not_synced;
+        return rename_result::NOT_SYNCED;
     }
     g_clear_pointer(&state->path, g_free);
-    return rename_result::done;
+    return rename_result::DONE;
 }
 
 // The temporary files of one call. What is left of them when it ends is removed.
@@ -235,6 +240,8 @@ static bool write_temporaries(std::span<const core_file> descriptors, const core
                               GError **error) {
     bool all_written = true;
     for (gsize i = 0; i < descriptors.size(); i++) {
+        // The stream is closed at the end of its round, whether or not its file was written.
+        wiped_stream_buffer buffer;
         if (stop_on_error && !all_written)
             break;
         (void)g_strlcpy(states[i].name, descriptors[i].name, sizeof states[i].name);
@@ -248,7 +255,7 @@ static bool write_temporaries(std::span<const core_file> descriptors, const core
                             "missing output data for cf '%s'", descriptors[i].name);
             *failed_bare += 1;
             all_written = false;
-        } else if (!cfile_write_temp(&descriptors[i], &source[i], state)) {
+        } else if (!cfile_write_temp(&descriptors[i], &source[i], state, &buffer)) {
             warn_unless(state->err != NULL);
             GError *cause = g_steal_pointer(&state->err);
             sync_state_clear(state);
@@ -266,12 +273,12 @@ static void rename_temporaries(std::span<const core_file> descriptors, core_file
         if (!source[i].dirty || !states[i].written)
             continue;
         const rename_result result = rename_temporary(&descriptors[i], &states[i]);
-        source[i].replaced = result != rename_result::not_renamed ? TRUE : FALSE;
-        if (result == rename_result::done)
+        source[i].replaced = result != rename_result::NOT_RENAMED ? TRUE : FALSE;
+        if (result == rename_result::DONE)
             source[i].dirty = FALSE;
         // A directory that was not synced does not stop the rest: with this file in place, the
         // others belong in place too.
-        if (stop_on_error && result == rename_result::not_renamed)
+        if (stop_on_error && result == rename_result::NOT_RENAMED)
             return;
     }
 }

@@ -23,10 +23,11 @@ static constexpr long NO_EXPIRY = -1;
 static constexpr unsigned long NO_FLAG = static_cast<unsigned long>(-1);
 
 // The C library's records hold pointers to non-constant characters.
-static char password_elsewhere[] = "x";
-static char no_password[] = "*";
-static char no_text[] = "";
+static char *written(const char *text) {
+    return const_cast<char *>(text);
+}
 
+// The C library's own copy of a hash is wiped as soon as there is ours: it stays in static storage.
 gpointer fetch_passwd(FILE *stream) {
     const struct passwd *line = fgetpwent(stream);
     if (line == nullptr)
@@ -35,6 +36,7 @@ gpointer fetch_passwd(FILE *stream) {
     auto *copy = g_new0(struct passwd, 1);
     copy->pw_name = g_strdup(line->pw_name);
     copy->pw_passwd = g_strdup(line->pw_passwd);
+    wipe_text(line->pw_passwd);
     copy->pw_uid = line->pw_uid;
     copy->pw_gid = line->pw_gid;
     copy->pw_gecos = g_strdup(line->pw_gecos);
@@ -64,6 +66,7 @@ gpointer fetch_shadow(FILE *stream) {
     *copy = *line;
     copy->sp_namp = g_strdup(line->sp_namp);
     copy->sp_pwdp = g_strdup(line->sp_pwdp);
+    wipe_text(line->sp_pwdp);
     return copy;
 }
 
@@ -84,6 +87,7 @@ gpointer fetch_group(FILE *stream) {
     auto *copy = g_new0(struct group, 1);
     copy->gr_name = g_strdup(line->gr_name);
     copy->gr_passwd = g_strdup(line->gr_passwd);
+    wipe_text(line->gr_passwd);
     copy->gr_gid = line->gr_gid;
     copy->gr_mem = g_strdupv(line->gr_mem);
     return copy;
@@ -99,18 +103,23 @@ void free_group(gpointer record) {
     g_free(line);
 }
 
+const char *shadow_password(const internal_user *user) {
+    return user->password != nullptr ? user->password : "*";
+}
+
+const char *passwd_password(const internal_user *user) {
+    return user->shadowed ? "x" : shadow_password(user);
+}
+
 int write_passwd(const void *record, FILE *stream) {
     const auto *user = static_cast<const internal_user *>(record);
 
     struct passwd line = {};
     line.pw_name = user->name;
-    if (user->shadowed)
-        line.pw_passwd = password_elsewhere;
-    else
-        line.pw_passwd = user->password != nullptr ? user->password : no_password;
+    line.pw_passwd = written(passwd_password(user));
     line.pw_uid = user->uid;
     line.pw_gid = user->gid;
-    line.pw_gecos = user->gecos != nullptr ? user->gecos : no_text;
+    line.pw_gecos = written(user->gecos != nullptr ? user->gecos : "");
     line.pw_dir = user->home;
     line.pw_shell = user->shell;
     return putpwent(&line, stream);
@@ -123,7 +132,7 @@ int write_shadow(const void *record, FILE *stream) {
 
     struct spwd line = {};
     line.sp_namp = user->name;
-    line.sp_pwdp = user->password != nullptr ? user->password : no_password;
+    line.sp_pwdp = written(shadow_password(user));
     line.sp_lstchg = user->last_change / SECONDS_PER_DAY;
     line.sp_min = MIN_DAYS;
     line.sp_max = MAX_DAYS;

@@ -8,6 +8,8 @@
 
 #include <glib.h>
 
+#include "usermgmt/account_records.h"
+
 // Each fetch returns one record with all of its strings, for the function below it to free:
 // struct passwd, struct spwd, struct group.
 gpointer fetch_passwd(FILE *stream);
@@ -16,6 +18,10 @@ gpointer fetch_shadow(FILE *stream);
 void free_shadow(gpointer record);
 gpointer fetch_group(FILE *stream);
 void free_group(gpointer record);
+
+// The password fields of a user's two lines. Borrowed.
+const char *passwd_password(const internal_user *user);
+const char *shadow_password(const internal_user *user);
 
 // An internal_user; "x" stands for the password of a shadowed one, "*" for an absent password.
 int write_passwd(const void *record, FILE *stream);

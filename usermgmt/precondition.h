@@ -19,8 +19,15 @@ struct file_stem {
     }
 };
 
-// Logs a critical record and returns the result (nothing for a void function). The expression is
-// part of the record, so it is written with NULL.
+// Both log a critical record when the expression does not hold. The expression is part of the
+// record, so it is written with NULL; that is why neither is built on the other, which would expand
+// it first.
+
+// Whether the expression holds.
+#define holds(expression) \
+    ((expression) || (g_return_if_fail_warning(G_LOG_DOMAIN, __func__, #expression), false))
+
+// Returns the result, nothing for a void function, unless the expression holds.
 #define require(expression, result)                                        \
     do {                                                                   \
         if (!(expression)) [[unlikely]] {                                  \

@@ -28,6 +28,13 @@ bool fail_missing_argument(const char *action, const char *argument, GError **er
     return false;
 }
 
+bool fail_and_reload(usermgmt_ctx *ctx, const char *action, const char *name, guint32 file_mask,
+                     GError **error) {
+    g_prefix_error(error, "Failed to %s '%s', ", action, name);
+    usermgmt_reload(ctx, file_mask);
+    return false;
+}
+
 static void usermgmt_ctx_free(usermgmt_ctx *ctx) {
     user_database_clear(&ctx->user_db);
     group_database_clear(&ctx->group_db);

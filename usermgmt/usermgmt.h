@@ -139,3 +139,37 @@ gboolean usermgmt_get_all_groups(const usermgmt_ctx *ctx, char ***out_groupnames
 // The type, …_NONE for an unknown name, …_INVALID for an unusable context or an absent name.
 guint32 usermgmt_get_user_type(const usermgmt_ctx *ctx, const char *username);
 guint32 usermgmt_get_group_type(const usermgmt_ctx *ctx, const char *groupname);
+
+// Changes. Each writes the files before it returns TRUE. On failure the error names the operation
+// and the account ("Failed to add user 'bob', ..."), and what changed in memory is dropped as far
+// as the operation's own rules say. A failed write leaves an error of the domain "corefile". A
+// context whose inner parts are missing is a programming error: a critical is logged, and there may
+// be no error.
+
+// The entry is only read; its password is clear text, its type decides what it may hold, and a uid
+// of -1 lets the database choose.
+gboolean usermgmt_add_user(usermgmt_ctx *ctx, const char *username, const user_entry *new_user,
+                           GError **error);
+
+// Changes what the entry holds; an absent field stays as it is, an empty list or text does not.
+// Name, type and UID cannot change.
+gboolean usermgmt_modify_user(usermgmt_ctx *ctx, const char *username, const user_entry *mod_user,
+                              GError **error);
+
+// Of the types "dynamic system" and "ornet" only. Removes the user from every group.
+gboolean usermgmt_delete_user(usermgmt_ctx *ctx, const char *username, GError **error);
+
+// Of the types "permanent" and "dynamic system" only. Nothing is written when there is no password.
+gboolean usermgmt_disable_password(usermgmt_ctx *ctx, const char *username, GError **error);
+
+// A group of type "dynamic system". The list of members may be null.
+gboolean usermgmt_add_group(usermgmt_ctx *ctx, const char *groupname, const char *const *usernames,
+                            GError **error);
+
+// Of the types "dynamic system" and "permanent system nvr" only, and no listed member's primary
+// group.
+gboolean usermgmt_delete_group(usermgmt_ctx *ctx, const char *groupname, GError **error);
+
+// Always fails: USERMGMT_ERROR_GROUP_MODIFICATION. Membership changes through users.
+gboolean usermgmt_modify_group(usermgmt_ctx *ctx, const char *groupname, const void *unused_first,
+                               const void *unused_second, GError **error);

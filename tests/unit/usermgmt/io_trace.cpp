@@ -38,6 +38,7 @@ bool io_trace::enter(const char *call, const std::string &path, const std::strin
     for (fault &armed : faults_) {
         if (armed.call != line || --armed.countdown != 0)
             continue;
+        has_struck_ = true;
         if (armed.error != 0)
             errno = armed.error;
         return false;

@@ -21,6 +21,8 @@ class io_trace {
     // Makes the nth call of that name on that path fail with the error number, or with errno left
     // as it was for 0. The call is not made, but fclose, which closes the stream however it ends.
     void fail(const std::string &call, const std::string &path, int nth, int error);
+    // Whether a call was made to fail.
+    bool has_struck() const { return has_struck_; }
 
     // "<call> <path>", followed by what else matters: mode and flags.
     const lines &calls() const { return calls_; }
@@ -40,6 +42,7 @@ class io_trace {
         int error;
     };
     std::vector<fault> faults_;
+    bool has_struck_ = false;
     std::map<int, std::string> paths_;
     lines calls_;
 };
