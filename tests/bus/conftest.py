@@ -17,6 +17,8 @@ from harness.service import Service
 from harness.syslog_socket import SyslogSocket
 from harness.world import Neighbour
 
+pytest_plugins = ["harness.stage_fixtures"]
+
 StartService = Callable[..., Service]
 
 

@@ -84,11 +84,9 @@ def test_user_is_refused_through_the_service(method: Method, real_service: Servi
 @every_implemented_method
 def test_root_is_allowed_through_the_service(method: Method, real_service: Service,
                                              bus: Bus) -> None:
-    before = real_service.output()
-
     call(bus, method)
 
-    assert real_service.output() == before
+    assert not [line for line in real_service.output() if "Authorization" in line]
 
 
 @every_implemented_method

@@ -6,6 +6,7 @@ from harness.fake_authz import CODE, DOMAIN, Check, FakeAuthz
 from harness.interface import IMPLEMENTED, METHODS, NOT_IMPLEMENTED, Method
 from harness.service import Service
 from harness.syslog_socket import SyslogSocket
+from harness.wire import Wire
 from harness.world import Neighbour, snapshot
 
 UNKNOWN = domain_error("privaneSystemError", 25, "Unknown")
@@ -76,6 +77,18 @@ def test_refused_call_does_nothing_else(method: Method, service: Service, bus: B
     error_of(call, bus, method)
 
     assert snapshot(cfgstore) == before
+
+
+@every_implemented_method
+def test_refused_call_sends_no_signal(method: Method, service: Service, authz: FakeAuthz) -> None:
+    authz.refuse("not for you")
+    wire = Wire()
+    try:
+        for refused in (method, method):
+            serial = wire.send(refused.member, refused.signature, *refused.arguments)
+            assert [message.kind for message in wire.until_reply(serial)] == ["error"]
+    finally:
+        wire.close()
 
 
 @every_implemented_method

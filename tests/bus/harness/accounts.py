@@ -71,6 +71,9 @@ class AccountFiles:
                            group + self._system.group)
 
 
+# The hash of "secret", which is clerk's password.
+SECRET_HASH = "$5$fixedsalt$K4ZxUsO9XaK31A5jPFIJg99Zd5sm7kTwAIilfyWVLg/"
+
 # The users that tests call as: all but stranger are in group privane, two also have a role.
 CLERK_UID, STRANGER_UID, VIEWER_UID, OPERATOR_UID = 701, 702, 703, 704
 VIEWER_ROLE_GID, OPERATOR_ROLE_GID = 750, 751
@@ -84,7 +87,7 @@ operator:x:{OPERATOR_UID}:{OPERATOR_UID}:Has another role:/:/usr/sbin/nologin
 """
 STANDARD_SHADOW = f"""\
 root:{HASH}:19000:0:99999:7:::
-clerk:!:19000:0:99999:7:::
+clerk:{SECRET_HASH}:19000:0:99999:7:::
 stranger:!:19000:0:99999:7:::
 viewer:!:19000:0:99999:7:::
 operator:!:19000:0:99999:7:::

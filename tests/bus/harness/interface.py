@@ -12,9 +12,7 @@ SIGNAL = "UserDatabaseUpdated"
 # The members that the service does not serve yet. A method that is added is taken out here.
 NOT_IMPLEMENTED = frozenset((
     "GetNetworkSpeedDuplex", "ReadLogFile", "SetTimeOfDay", "UpdateReleaseFile", "Reboot",
-    "RtspreadConfig", "Pinsrv", "Digest", "AuthUserBasic", "AdjTime", "NotifyTimeSync",
-    "AddSystemUser", "ModifyUser", "ClearUserFields", "AddUser", "AddUidUser", "RemoveUser",
-    "ChpasswdUser", "AddGroup", "RemoveGroup", "GetDigestList", "ReadBootblockParam",
+    "RtspreadConfig", "Pinsrv", "AdjTime", "NotifyTimeSync", "ReadBootblockParam",
     "AddBootblockParam", "ReadSerno", "StartNtp", "RestartNtp", "StopNtp", "StartLensd",
     "StopLensd", "GetActiveNetworkInfo", "StartService", "StopService", "RestartService",
     "ReloadService", "SetDefaultTarget", "GetSlabinfo", "ExecuteEthtool", "ExecuteSmartctl",

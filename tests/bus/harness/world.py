@@ -10,8 +10,10 @@ from harness.deadline import wait_for
 
 # Files that a method writes, and the folders in which it would make new ones.
 FILES = tuple(Path(path) for path in (
-    "/etc/passwd", "/etc/shadow", "/etc/group", "/etc/apache2/digest_auth_passwd"))
-FOLDERS = tuple(Path(path) for path in ("/", "/etc", "/etc/apache2", "/run", "/tmp", "/dev"))
+    "/etc/passwd", "/etc/shadow", "/etc/group", "/etc/apache2/digest_auth_passwd",
+    "/etc/privane/parameters.conf"))
+FOLDERS = tuple(Path(path) for path in (
+    "/", "/etc", "/etc/apache2", "/etc/privane", "/run", "/tmp", "/dev"))
 
 
 @dataclass(frozen=True)

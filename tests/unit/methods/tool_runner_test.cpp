@@ -1,0 +1,115 @@
+// tests/unit/methods/tool_runner_test.cpp: running a tool.
+#include "methods/tool_runner.h"
+
+#include <csignal>
+#include <cstdlib>
+#include <string>
+
+#include <fcntl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+class ToolRunner : public testing::Test {
+  protected:
+    ~ToolRunner() override {
+        tool_result_clear(&result_);
+        g_clear_error(&error_);
+    }
+    // Whether /bin/sh could be started with the script.
+    bool run_script(const char *script, tool_capture capture) {
+        tool_result_clear(&result_);
+        const char *const argv[] = {"/bin/sh", "-c", script, "sh", "a b", "$(c)", "", nullptr};
+        return run_tool(argv, capture, &result_, &error_);
+    }
+    static std::string text(const char *captured) {
+        return captured != nullptr ? captured : "none";
+    }
+    std::string output() const { return text(result_.output); }
+    std::string error_output() const { return text(result_.error_output); }
+
+    tool_result result_ = {};
+    GError *error_ = nullptr;
+};
+
+TEST_F(ToolRunner, ArgumentsArriveAsTheyAre) {
+    EXPECT_TRUE(run_script("printf '<%s>' \"$@\"", tool_capture::OUTPUT));
+    EXPECT_EQ(output(), "<a b><$(c)><>");
+    EXPECT_TRUE(tool_succeeded(result_));
+}
+
+TEST_F(ToolRunner, OnlyWhatWasAskedForIsCaptured) {
+    static constexpr const char *script = "echo out; echo err >&2";
+    testing::internal::CaptureStdout();
+    testing::internal::CaptureStderr();
+
+    EXPECT_TRUE(run_script(script, tool_capture::BOTH));
+    EXPECT_EQ(output() + error_output(), "out\nerr\n");
+    EXPECT_TRUE(run_script(script, tool_capture::OUTPUT_WITHOUT_ERRORS));
+    EXPECT_EQ(output() + error_output(), "out\nnone");
+    EXPECT_EQ(testing::internal::GetCapturedStdout(), "");
+    EXPECT_EQ(testing::internal::GetCapturedStderr(), "");
+}
+
+TEST_F(ToolRunner, WhatIsNotCapturedGoesWhereOursGoes) {
+    static constexpr const char *script = "echo out; echo err >&2";
+    testing::internal::CaptureStdout();
+    testing::internal::CaptureStderr();
+
+    EXPECT_TRUE(run_script(script, tool_capture::NOTHING));
+    EXPECT_EQ(output() + error_output(), "nonenone");
+    EXPECT_TRUE(run_script(script, tool_capture::OUTPUT));
+    EXPECT_EQ(output() + error_output(), "out\nnone");
+    EXPECT_EQ(testing::internal::GetCapturedStdout(), "out\n");
+    EXPECT_EQ(testing::internal::GetCapturedStderr(), "err\nerr\n");
+}
+
+TEST_F(ToolRunner, StatusTellsHowItEnded) {
+    EXPECT_TRUE(run_script("exit 3", tool_capture::NOTHING));
+    EXPECT_EQ(result_.wait_status, 3 << 8);
+    EXPECT_FALSE(tool_succeeded(result_));
+
+    EXPECT_TRUE(run_script("kill -9 $$", tool_capture::NOTHING));
+    EXPECT_EQ(WTERMSIG(result_.wait_status), SIGKILL);
+    EXPECT_FALSE(tool_succeeded(result_));
+
+    EXPECT_TRUE(run_script("exit 0", tool_capture::NOTHING));
+    EXPECT_TRUE(tool_succeeded(result_));
+}
+
+TEST_F(ToolRunner, WhatCannotBeStartedIsAnErrorWithoutStatus) {
+    for (const char *program : {"/nonexistent/tool", "/etc/passwd"}) {
+        tool_result_clear(&result_);
+        g_clear_error(&error_);
+        const char *const argv[] = {program, nullptr};
+
+        EXPECT_FALSE(run_tool(argv, tool_capture::BOTH, &result_, &error_)) << program;
+        ASSERT_NE(error_, nullptr) << program;
+        EXPECT_EQ(error_->domain, G_SPAWN_ERROR) << program;
+        EXPECT_EQ(result_.wait_status, -1) << program;
+        EXPECT_FALSE(tool_succeeded(result_)) << program;
+    }
+}
+
+TEST_F(ToolRunner, PathIsNotSearched) {
+    const char *const argv[] = {"sh", "-c", "true", nullptr};
+
+    EXPECT_FALSE(run_tool(argv, tool_capture::NOTHING, &result_, &error_));
+    EXPECT_TRUE(g_error_matches(error_, G_SPAWN_ERROR, G_SPAWN_ERROR_NOENT));
+}
+
+TEST_F(ToolRunner, EnvironmentIsInheritedAndDescriptorsAreNot) {
+    const int open_here = open("/dev/null", O_RDONLY);
+    ASSERT_GT(open_here, 2);
+    ASSERT_EQ(setenv("TOOL_RUNNER_TEST", "inherited", 1), 0);
+
+    EXPECT_TRUE(
+        run_script("echo $TOOL_RUNNER_TEST; readlink /proc/self/fd/0; cd /proc/$$/fd; "
+                   "for fd in *; do [ $fd -gt 2 ] && [ -e $fd ] && readlink $fd; done",
+                   tool_capture::OUTPUT));
+    EXPECT_EQ(output().substr(0, output().find("/dev/null") + 10), "inherited\n/dev/null\n");
+    EXPECT_EQ(output().find("/dev/null", output().find("/dev/null") + 1), std::string::npos);
+    (void)unsetenv("TOOL_RUNNER_TEST");
+    (void)close(open_here);
+}
