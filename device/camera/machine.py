@@ -93,12 +93,15 @@ class Camera:
         deadline = Deadline(BOOT_SECONDS, "starting the camera")
         self.qmp.greet(deadline)
         if booting:
-            self.shell.wait_until_ready(deadline)
-            state = self.shell.run("systemctl is-system-running --wait", deadline).out.strip()
-            if state != "running":
-                failed = self.shell.run(SHOW_FAILED_UNITS, deadline).out
-                raise CameraError(f"the camera is up, but {state}:\n{failed}")
+            self._wait_until_booted(deadline)
         self.shell.run("true", deadline).check()
+
+    def _wait_until_booted(self, deadline: Deadline) -> None:
+        self.shell.wait_until_ready(deadline)
+        state = self.shell.run("systemctl is-system-running --wait", deadline).out.strip()
+        if state != "running":
+            failed = self.shell.run(SHOW_FAILED_UNITS, deadline).out
+            raise CameraError(f"the camera is up, but {state}:\n{failed}")
 
     @property
     def running(self) -> bool:
@@ -137,6 +140,14 @@ class Camera:
             # A machine that stood still before goes on standing still otherwise.
             self.qmp.execute("cont", deadline)
             self.shell.run("true", deadline).check()
+
+    def cut_power(self) -> None:
+        """Takes the power away for a moment; returns when the camera is up again from its disk."""
+        with self._explained():
+            deadline = Deadline(BOOT_SECONDS, "booting the camera after a power cut")
+            self.qmp.execute("system_reset", deadline)
+            self.qmp.wait_for_event("RESET", deadline)
+            self._wait_until_booted(deadline)
 
     def power_off(self, timeout: float = 60) -> dict[str, Any]:
         """Presses the power button, waits until QEMU is gone, and returns its event about it."""

@@ -1,11 +1,13 @@
 """tests/device/accounts.py: the account files of the camera as the service must see them."""
 from dataclasses import dataclass
 
+from camera.change_tour import DIGEST_FILE, FILES
 from camera.machine import Camera
 
-FILES = ("/etc/passwd", "/etc/shadow", "/etc/group")
 USER_RANGES = ((0, 0), (1, 499), (500, 999), (1000, 60000), (65534, 65534))
 GROUP_RANGES = ((0, 0), (1, 499), (500, 999), (65534, 65534), (60001, 60010))
+# Temporary files of a rewriting, and whatever else is named after one of them.
+LIST_BESIDE = f"ls -dA /etc/passwd* /etc/shadow* /etc/group* {DIGEST_FILE.rpartition('/')[0]}/*"
 
 
 @dataclass(frozen=True)
@@ -52,7 +54,24 @@ def fingerprint(camera: Camera) -> str:
     """Content, inode, times, owner and mode of the account files, and what lies beside them."""
     names = " ".join(FILES)
     return camera.run(f"sha256sum {names}; stat -c '%n %i %y %z %U %G %a %s' {names}; "
-                      "ls /etc | grep -E '^(passwd|shadow|group)'").check().out
+                      f"{LIST_BESIDE}").check().out
+
+
+def contents(camera: Camera) -> dict[str, bytes]:
+    """What stands in each of the files."""
+    return {path: camera.read_file(path) for path in FILES}
+
+
+def access(camera: Camera) -> str:
+    """Owner and mode of each of the files, and what lies beside them; a lock may."""
+    return camera.run(f"stat -c '%n %U:%G %a' {' '.join(FILES)}; "
+                      f"{LIST_BESIDE} | grep -v '[.]lock$'").check().out
+
+
+def lines_with(camera: Camera, name: str) -> dict[str, int]:
+    """The number of lines in each of the files that have a name as a word."""
+    shown = camera.run(["grep", "-cw", name, *FILES]).out
+    return {path: int(count) for path, count in (line.split(":") for line in shown.splitlines())}
 
 
 def _lines(camera: Camera, path: str) -> list[list[str]]:

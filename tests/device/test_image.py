@@ -1,10 +1,13 @@
 """tests/device/test_image.py: what the installation left in the camera's image."""
+from camera.change_tour import DIGEST_FILE
 from camera.machine import Camera
 
 INSTALLED = (
     "/usr/sbin/privane_system",
     "/usr/lib/x86_64-linux-gnu/libauthz.so.1",
+    "/usr/lib/x86_64-linux-gnu/libdigestentry.so.1",
     "/usr/lib/x86_64-linux-gnu/liblogbackend.so.1",
+    "/usr/lib/x86_64-linux-gnu/libparamcli.so.1",
     "/usr/lib/systemd/system/privane-system.service",
     "/usr/lib/sysusers.d/privane-system.conf",
     "/usr/share/dbus-1/interfaces/com.zintor.PrivaneSystem.xml",
@@ -35,7 +38,7 @@ def test_system_accounts_have_the_ids_of_a_type(camera: Camera) -> None:
 
 
 def test_every_library_is_there(camera: Camera) -> None:
-    shown = camera.run(["ldd", *INSTALLED[:3]]).check().out
+    shown = camera.run(["ldd", *INSTALLED[:5]]).check().out
     assert "libauthz.so.1 => /" in shown
     assert "not found" not in shown
 
@@ -43,3 +46,15 @@ def test_every_library_is_there(camera: Camera) -> None:
 def test_nothing_failed_at_boot(camera: Camera) -> None:
     assert camera.run(["systemctl", "is-system-running"]).out == "running\n"
     assert camera.run(["systemctl", "--failed", "--no-legend"]).check().out == ""
+
+
+def test_what_the_service_needs_of_the_camera(camera: Camera) -> None:
+    camera.run(["test", "-x", "/bin/pidof"]).check()
+    for unit in ("apache2", "cfgstore", "account-watcher"):
+        assert camera.run(["systemctl", "is-active", unit]).out == "active\n"
+    pid = camera.run(["systemctl", "show", "--value", "-p", "MainPID", "cfgstore"]).check().out
+    assert camera.run(["/bin/pidof", "cfgstore"]).out == pid
+    shown = camera.run(["stat", "-c", "%U:%G %a %s", DIGEST_FILE]).check().out
+    assert shown == "root:www-data 640 0\n"
+    # Nobody would keep it in step with the group file.
+    assert camera.run(["test", "-e", "/etc/gshadow"]).status == 1

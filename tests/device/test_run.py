@@ -38,6 +38,7 @@ def test_without_a_terminal(build_dir: Path) -> None:
     assert done.stderr == ""
     for text in ("root@camera# gdbus call", "cam-web@camera$ gdbus call",
                  f"-m {NAME}.GetGroupListFull", "_usermgmt.Code3: Could not retrieve user",
+                 "+anna:x:1000:100:Anna at the desk::/bin/false", "UserDatabaseUpdated ()",
                  "powering the camera off"):
         assert text in done.stdout
     # What was made before is used again, which is why a later start takes seconds.
