@@ -1,11 +1,11 @@
 // service/main.cpp: start-up, bus ownership, main loop and shutdown.
-#include <unistd.h>
-
 #include <bit>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+
+#include <unistd.h>
 
 #include <gio/gio.h>
 

@@ -1,12 +1,12 @@
 // service/quit_signals.cpp: SIGHUP, SIGINT and SIGTERM as events of the main loop.
 #include "service/quit_signals.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <array>
 #include <cerrno>
 #include <csignal>
+
+#include <fcntl.h>
+#include <unistd.h>
 
 #include <glib-unix.h>
 

@@ -1,13 +1,13 @@
 // usermgmt/core_file.cpp: reading the account files and replacing them atomically.
 #include "usermgmt/core_file.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <array>
 #include <cerrno>
 #include <cstdarg>
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include "usermgmt/precondition.h"
 #include "usermgmt/secret.h"

@@ -1,9 +1,9 @@
 // usermgmt/core_file_cache.h: the parsed account files that a context keeps, internal to usermgmt.
 #pragma once
 
-#include <sys/types.h>
-
 #include <ctime>
+
+#include <sys/types.h>
 
 #include <glib.h>
 

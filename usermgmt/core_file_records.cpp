@@ -1,12 +1,12 @@
 // usermgmt/core_file_records.cpp: the lines of the three account files.
 #include "usermgmt/core_file_records.h"
 
+#include <cstring>
+#include <type_traits>
+
 #include <grp.h>
 #include <pwd.h>
 #include <shadow.h>
-
-#include <cstring>
-#include <type_traits>
 
 #include "usermgmt/account_records.h"
 #include "usermgmt/name_set.h"

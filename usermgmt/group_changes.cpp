@@ -1,7 +1,7 @@
 // usermgmt/group_changes.cpp: adding and deleting groups, and the refusal to modify one.
-#include <syslog.h>
-
 #include <cstring>
+
+#include <syslog.h>
 
 #include "usermgmt/context.h"
 #include "usermgmt/id_allocation.h"

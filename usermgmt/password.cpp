@@ -1,15 +1,15 @@
 // usermgmt/password.cpp: rules for clear text, salts and hashing.
 #include "usermgmt/password.h"
 
-#include <crypt.h>
-#include <fcntl.h>
-#include <syslog.h>
-#include <unistd.h>
-
 #include <array>
 #include <cerrno>
 #include <cstring>
 #include <ctime>
+
+#include <crypt.h>
+#include <fcntl.h>
+#include <syslog.h>
+#include <unistd.h>
 
 #include "usermgmt/precondition.h"
 #include "usermgmt/secret.h"

@@ -1,14 +1,14 @@
 // usermgmt/record_check.cpp: whether a record survives being written and read.
 #include "usermgmt/record_check.h"
 
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
 #include <grp.h>
 #include <pwd.h>
 #include <shadow.h>
 #include <sys/types.h>
-
-#include <cerrno>
-#include <cstdio>
-#include <cstring>
 
 #include "usermgmt/core_file.h"
 #include "usermgmt/core_file_records.h"

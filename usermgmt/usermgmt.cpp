@@ -1,9 +1,9 @@
 // usermgmt/usermgmt.cpp: opening, closing, reloading and writing the database.
 #include "usermgmt/usermgmt.h"
 
-#include <syslog.h>
-
 #include <type_traits>
+
+#include <syslog.h>
 
 #include "usermgmt/context.h"
 
