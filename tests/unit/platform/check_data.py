@@ -13,16 +13,19 @@ import xml.etree.ElementTree as ET
 DATA, UNIT, INTERFACE = (pathlib.Path(argument) for argument in sys.argv[1:4])
 NAME = "com.zintor.PrivaneSystem"
 PREFIX = "com.zintor.privane-system."
-UNIT_METHODS = {"StartService", "StopService", "RestartService", "ReloadService", "SetDefaultTarget"}
+SERVICE_ACTIONS = {"startservice": "Start", "stopservice": "Stop", "restartservice": "Restart",
+                   "reloadservice": "Reload"}
+UNIT_ACTIONS = {*SERVICE_ACTIONS, "setdefaulttarget"}
 VIEWER_ACTIONS = {"checkgroup", "checkuser", "getgroup", "getgrouplist", "getgrouplistfull", "getuser",
                   "getuserlist"}
-ROOT_ACTIONS = {"addbootblockparam", "adduser", "chpasswduser", "modifyuser", "pinsrv", "readlogfile"}
+ROOT_ACTIONS = {"addbootblockparam", "adduiduser", "adduser", "chpasswduser", "digest", "modifyuser",
+                "pinsrv", "readlogfile"}
 
 
 def fixed_actions():
-    """The actions of the interface's methods, but for those that a unit's name is part of."""
+    """The actions of the interface's methods; those of a unit have theirs as a parent."""
     methods = {method.get("name") for method in ET.parse(INTERFACE).iter("method")}
-    actions = {name.lower() for name in methods - UNIT_METHODS}
+    actions = {name.lower() for name in methods}
     actions -= {"addsystemuser", "getactivenetworkinfo"}
     return actions | {"getactivenetworkinfo.all", "getactivenetworkinfo.tcp-udp"}
 
@@ -35,16 +38,11 @@ def read_ini(path):
     return parser
 
 
-class PolkitPolicy(unittest.TestCase):
-    def setUp(self):
-        self.actions = ET.parse(DATA / "com.zintor.privane-system.policy").getroot().findall("action")
-
-    def test_each_fixed_action_is_declared_once(self):
-        declared = [action.get("id") for action in self.actions]
-        self.assertEqual(len(declared), 41)
-        self.assertEqual(sorted(declared), sorted(PREFIX + name for name in fixed_actions()))
+class PolicyChecks:
+    """What holds for every .policy file of ours."""
 
     def test_all_are_refused_by_default(self):
+        self.assertGreater(len(self.actions), 0)
         for action in self.actions:
             defaults = {entry.tag: entry.text for entry in action.find("defaults")}
             self.assertEqual(defaults, {"allow_any": "no", "allow_inactive": "no", "allow_active": "no"},
@@ -57,6 +55,86 @@ class PolkitPolicy(unittest.TestCase):
             self.assertEqual([entry.tag for entry in action], ["description", "message", "defaults"])
             self.assertRegex(action.findtext("description"), r"^[A-Z].*[^. ]$")
             self.assertRegex(action.findtext("message"), r"^Authorization is required for .*[^. ]\.$")
+
+
+class PolkitPolicy(PolicyChecks, unittest.TestCase):
+    def setUp(self):
+        self.actions = ET.parse(DATA / "com.zintor.privane-system.policy").getroot().findall("action")
+
+    def test_each_fixed_action_is_declared_once(self):
+        declared = [action.get("id") for action in self.actions]
+        self.assertEqual(len(declared), 46)
+        self.assertEqual(sorted(declared), sorted(PREFIX + name for name in fixed_actions()))
+
+
+def run_generator(*units):
+    return subprocess.run([DATA / "privane-unit-actions", *units], capture_output=True, text=True, check=False)
+
+
+class UnitActions(PolicyChecks, unittest.TestCase):
+    """The policy that privane-unit-actions prints."""
+
+    UNITS = ["sshd.service", "recorder@.service", "multi-user.target", "a" * 64 + ".service", "-0.service"]
+
+    def setUp(self):
+        result = run_generator(*self.UNITS)
+        self.assertEqual((result.returncode, result.stderr), (0, ""))
+        self.text = result.stdout
+        self.actions = ET.fromstring(self.text.encode()).findall("action")
+
+    def test_a_service_has_four_actions_and_a_target_has_one(self):
+        parts = ["sshd", "recorder.any", "a" * 64, "-0"]
+        expected = [f"{action}.{part}" for part in parts for action in SERVICE_ACTIONS]
+        self.assertEqual(sorted(action.get("id") for action in self.actions),
+                         sorted(PREFIX + name for name in [*expected, "setdefaulttarget.multi-user"]))
+
+    def test_texts_name_verb_and_unit(self):
+        texts = {action.get("id"): (action.findtext("description"), action.findtext("message"))
+                 for action in self.actions}
+        for action, verb in SERVICE_ACTIONS.items():
+            description, message = texts[f"{PREFIX}{action}.sshd"]
+            self.assertEqual(description, f"{verb} sshd.service")
+            self.assertRegex(message, rf" {verb.lower()[:4]}\w*ing sshd\.service\.$")
+            self.assertEqual(texts[f"{PREFIX}{action}.recorder.any"][0],
+                             f"{verb} any instance of recorder@.service")
+        self.assertEqual(texts[PREFIX + "setdefaulttarget.multi-user"][0], "Boot into multi-user.target")
+
+    def test_declaration_is_that_of_the_packaged_policy(self):
+        packaged = (DATA / "com.zintor.privane-system.policy").read_text(encoding="utf-8")
+        head = re.compile(r".*?(?=<!--)", re.DOTALL)
+        self.assertEqual(head.match(self.text).group(), head.match(packaged).group())
+
+    def test_order_repetition_and_locale_change_nothing(self):
+        self.assertEqual(run_generator(*reversed(self.UNITS), *self.UNITS).stdout, self.text)
+        foreign = subprocess.run([DATA / "privane-unit-actions", *self.UNITS], check=True,
+                                 capture_output=True, text=True, env={"LC_ALL": "C.UTF-8"})
+        self.assertEqual(foreign.stdout, self.text)
+
+    def test_unit_that_no_caller_could_name_is_refused(self):
+        cases = {
+            "": "neither a .service nor a .target", "sshd": "neither a .service nor a .target",
+            "dbus.socket": "neither a .service nor a .target",
+            "sshd.service ": "neither a .service nor a .target",
+            ".service": "no name", "@.service": "no name", "@.target": "no name",
+            "getty@tty1.service": "an instance has its template's action, getty@",
+            "a@@.service": "an instance has its template's action, a@",
+            "@a.service": "an instance has its template's action, @",
+            "a" * 65 + ".service": "longer than 64 characters",
+            **{f"{name}.service": "no caller could give that name" for name in (
+                "Sshd", "a.b", "a_b", "a b", "a\nb", "a&b", "<a>", "a--\u00e9", "a/b", "a:b", "a\\b", "a*")},
+        }
+        for unit, reason in cases.items():
+            for units in ((unit,), ("sshd.service", unit)):
+                result = run_generator(*units)
+                self.assertEqual((result.returncode, result.stdout), (1, ""), unit)
+                self.assertTrue(result.stderr.startswith(f"privane-unit-actions: '{unit}': "), unit)
+                self.assertIn(reason, result.stderr)
+
+    def test_wrong_call_is_told_the_right_one(self):
+        for units in ((), ("--help",), ("-h", "sshd.service")):
+            result = run_generator(*units)
+            self.assertEqual((result.returncode, result.stdout), (2, ""))
+            self.assertRegex(result.stderr, r"^usage: privane-unit-actions ")
 
 
 class ExampleRules(unittest.TestCase):
@@ -80,15 +158,24 @@ class ExampleRules(unittest.TestCase):
     def test_what_amounts_to_root_is_named_and_not_granted(self):
         viewer, _ = self.granted("viewer")
         operator, text = self.granted("operator")
-        self.assertFalse(ROOT_ACTIONS & (viewer | operator))
+        self.assertFalse((ROOT_ACTIONS | UNIT_ACTIONS) & (viewer | operator))
         comment = "\n".join(line for line in text.splitlines() if line.startswith("//"))
         for name in ROOT_ACTIONS:
             self.assertIn(name, comment)
 
+    def test_units_are_compared_whole_and_for_their_actions(self):
+        text = (DATA / "examples" / "60-privane-units.rules").read_text(encoding="utf-8")
+        listed = re.search(r"var granted = \{(.*?)\};", text, re.DOTALL).group(1)
+        granted = dict(re.findall(r'"(\w+)": \["([-a-z0-9]+@?)"\]', listed))
+        self.assertEqual(granted, {"reloadservice": "sshd", "restartservice": "sshd",
+                                   "startservice": "recorder@", "stopservice": "recorder@"})
+        self.assertIn('.indexOf(action.lookup("unit")) >= 0', text)
+        self.assertIn('subject.isInGroup("privane-units")', text)
+
     def test_sysusers_makes_their_groups(self):
         lines = (DATA / "examples" / "privane-roles.sysusers.conf").read_text(encoding="utf-8").splitlines()
         self.assertEqual([line for line in lines if not line.startswith("#")],
-                         ["g privane-viewer -", "g privane-operator -"])
+                         ["g privane-viewer -", "g privane-operator -", "g privane-units -"])
 
 
 class BusFiles(unittest.TestCase):
@@ -123,6 +210,13 @@ class BusFiles(unittest.TestCase):
     def test_sysusers_makes_the_group(self):
         lines = (DATA / "privane-system.sysusers.conf").read_text(encoding="utf-8").splitlines()
         self.assertEqual([line for line in lines if not line.startswith("#")], ["g privane -"])
+
+
+class BootEnvironmentLock(unittest.TestCase):
+    def test_is_made_before_anybody_else_can(self):
+        lines = (DATA / "privane-system.tmpfiles.conf").read_text(encoding="utf-8").splitlines()
+        self.assertEqual([line for line in lines if not line.startswith("#")],
+                         ["f /run/lock/fw_printenv.lock 0600 root root -"])
 
 
 class Unit(unittest.TestCase):

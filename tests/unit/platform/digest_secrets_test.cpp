@@ -10,16 +10,6 @@
 #include "tests/unit/platform/process_memory.h"
 #include "tests/unit/platform/scratch_folder.h"
 
-template <std::size_t size>
-struct veiled_literal {
-    char text[size];
-
-    consteval explicit veiled_literal(const char (&literal)[size]) : text{} {
-        std::transform(literal, literal + size, text, veil);
-    }
-    std::string string() const { return {text, size - 1}; }
-};
-
 static constexpr veiled_literal PASSWORD("Tr0ub4dor-and-3-Staples");
 static constexpr veiled_literal HASH("d3ef676f7560703ca411b3bfd32a30d9");
 static constexpr veiled_literal HASH_BYTES(

@@ -28,6 +28,8 @@ static constexpr const char *INTERFACE_XML =
     "</method>"
     "</interface></node>";
 
+static const std::string UNIT_PREFIX = "com.zintor.privane-system.";
+
 struct service {
     int ready_fd;
     bool mortal;
@@ -72,6 +74,46 @@ static std::string describe(GVariant *question) {
            (*cancellation != '\0' ? ", cancellable" : "");
 }
 
+static void answer_undeclared(GDBusMethodInvocation *call, const std::string &action) {
+    answer_with_error(call, "Action " + action + " is not registered");
+}
+
+// Yes, no, or only with a password, as the word says; false for another word.
+static bool answer_word(GDBusMethodInvocation *call, const std::string &word) {
+    if (word != "allowed" && word != "refused" && word != "password")
+        return false;
+    answer(call, word == "allowed", word == "password");
+    return true;
+}
+
+// A parent is asked with details, of which the unit decides.
+static void on_parent(GVariant *question, GDBusMethodInvocation *call) {
+    g_autoptr(GVariant) details = g_variant_get_child_value(question, 2);
+    const char *action = "none";
+    const char *unit = "none";
+    (void)g_variant_lookup(details, "action", "&s", &action);  // Shown as missing otherwise.
+    (void)g_variant_lookup(details, "unit", "&s", &unit);
+
+    const std::string name = unit;
+    if (!answer_word(call, name) && name != "silent")
+        answer_with_error(call, describe(question) + ", action " + action + ", unit " + unit);
+}
+
+static void on_unit_question(const std::string &action, GVariant *question,
+                             GDBusMethodInvocation *call) {
+    const std::string rest = action.substr(UNIT_PREFIX.size());
+    const std::size_t dot = rest.find('.');
+    const std::string unit = dot != std::string::npos ? rest.substr(dot + 1) : "";
+
+    if (dot == std::string::npos && rest != "setdefaulttarget")
+        on_parent(question, call);
+    else if (unit == "broken")
+        answer_with_error(call, "Action " + action + " is broken");
+    else if (unit.rfind("declared-", 0) != 0 ||
+             !answer_word(call, unit.substr(std::strlen("declared-"))))
+        answer_undeclared(call, action);
+}
+
 static void on_question(GDBusConnection *bus, service *self, GVariant *question,
                         GDBusMethodInvocation *call) {
     const char *action = nullptr;
@@ -84,8 +126,10 @@ static void on_question(GDBusConnection *bus, service *self, GVariant *question,
         answer(call, false, false);
     else if (name == "test.password")
         answer(call, false, true);
+    else if (name.rfind(UNIT_PREFIX, 0) == 0)
+        on_unit_question(name, question, call);
     else if (name == "test.undeclared")
-        answer_with_error(call, "Action test.undeclared is not registered");
+        answer_undeclared(call, name);
     else if (name == "test.question")
         answer_with_error(call, describe(question));
     else if (name == "test.cancelled")

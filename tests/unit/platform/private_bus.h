@@ -36,6 +36,15 @@ class private_bus {
 //   test.cancelled     yes when a question was cancelled before
 //   test.last-answer   yes, and exits
 //   test.last-question exits without an answer where it is a mortal one, else yes
+//
+// Of the actions on units, which begin with com.zintor.privane-system:
+//
+//   ACTION.declared-WORD  the word: allowed, refused or password
+//   ACTION.broken         an error of another text than an action has that is not known
+//   ACTION.OTHER          the error for an action that is not known
+//   setdefaulttarget      likewise
+//   ACTION                by the detail "unit": one of the words, nothing for silent, else an error
+//                         whose text shows the question as it came
 class fake_polkit {
   public:
     enum class end { MORTAL, IMMORTAL };

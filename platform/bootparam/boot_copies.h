@@ -1,0 +1,52 @@
+// platform/bootparam/boot_copies.h: the copies of the boot environment, beside libubootenv, which
+// keeps them to itself; internal.
+#pragma once
+
+#include <cstddef>
+
+#include <sys/types.h>
+
+// The copies that a description names: one, or two that are written in turn. What fails answers a
+// negative errno value.
+class boot_copies {
+  public:
+    boot_copies() = default;
+    ~boot_copies();
+    boot_copies(const boot_copies &) = delete;
+    boot_copies &operator=(const boot_copies &) = delete;
+
+    // Reads the description. -EINVAL where it names no copy that could hold a parameter.
+    int read_config(const char *path);
+
+    // Opens their devices. Before a write, so that sync learns of all that failed since.
+    int open();
+
+    // What of a copy is left for parameters.
+    std::size_t capacity() const;
+
+    // The longest list of flags in any copy, with what libubootenv adds to it when it writes the
+    // list again; 0 where there is none. The copies are open.
+    std::size_t flags_length() const;
+
+    // libubootenv does not look at the result of its own fsync. The copies are open.
+    int sync() const;
+
+  private:
+    static constexpr int MAX_COPIES = 2;
+
+    struct copy {
+        char *device;
+        off_t offset;  // from the end where it is negative
+        std::size_t size;
+        int fd;
+    };
+
+    bool read_line(const char *line);
+
+    copy copies_[MAX_COPIES] = {};
+    int count_ = 0;
+};
+
+// Waits until nobody holds the lock of U-Boot's tools, for at most 3 seconds: -EBUSY. libubootenv
+// itself would wait for ever, and would go on without a lock where the file cannot be opened.
+int await_boot_lock();
