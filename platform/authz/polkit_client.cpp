@@ -5,10 +5,13 @@
 // loop is dispatched meanwhile.
 #include "platform/authz/polkit_client.h"
 
+#include <cstring>
+
 #include <gio/gio.h>
 #include <polkit/polkit.h>
 
 #include "platform/authz/authz_error.h"
+#include "platform/authz/unit_action.h"
 
 static constexpr const char *AUTHORITY_PATH = "/org/freedesktop/PolicyKit1/Authority";
 static constexpr const char *AUTHORITY_INTERFACE = "org.freedesktop.PolicyKit1.Authority";
@@ -28,6 +31,13 @@ struct polkit_client {
 };
 
 static polkit_client client;
+
+struct question {
+    const char *sender;
+    const char *action_id;
+    PolkitDetails *details;
+    gint64 deadline;
+};
 
 struct pending_check {
     GCancellable *cancellable;
@@ -87,18 +97,19 @@ static polkit_answer answer_of(PolkitAuthorizationResult *result) {
                                                                 : polkit_answer::REFUSED;
 }
 
-static bool ask_once(PolkitSubject *subject, const char *action_id, gint64 deadline,
-                     polkit_answer *out_answer, GError **error) {
-    if (!open_authority(deadline, error))
+static bool ask_once(const question &asked, polkit_answer *out_answer, GError **error) {
+    if (!open_authority(asked.deadline, error))
         return false;
 
+    g_autoptr(PolkitSubject) subject = polkit_system_bus_name_new(asked.sender);
     g_autoptr(GCancellable) cancellable = g_cancellable_new();
     pending_check pending = {cancellable, nullptr};
-    g_autoptr(GSource) timer = g_timeout_source_new(static_cast<guint>(remaining_ms(deadline)));
+    g_autoptr(GSource) timer =
+        g_timeout_source_new(static_cast<guint>(remaining_ms(asked.deadline)));
     g_source_set_callback(timer, on_deadline, &pending, nullptr);
     (void)g_source_attach(timer, client.context);  // Its number is not needed to destroy it.
 
-    polkit_authority_check_authorization(client.authority, subject, action_id, nullptr,
+    polkit_authority_check_authorization(client.authority, subject, asked.action_id, asked.details,
                                          POLKIT_CHECK_AUTHORIZATION_FLAGS_NONE, cancellable,
                                          on_answer, &pending);
     while (pending.result == nullptr)
@@ -116,9 +127,11 @@ static bool ask_once(PolkitSubject *subject, const char *action_id, gint64 deadl
     return true;
 }
 
-// Whether the question went to a polkit that was just being replaced.
+// Whether the question went to a polkit that was just being replaced. One that has given up its
+// name and not yet gone, the bus does not let anybody call.
 static bool is_stale_owner(const GError *error) {
     return g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_NO_REPLY) ||
+           g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_ACCESS_DENIED) ||
            g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_NAME_HAS_NO_OWNER) ||
            g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_SERVICE_UNKNOWN);
 }
@@ -150,30 +163,54 @@ static void await_owner(gint64 deadline) {
         g_usleep(OWNER_POLL_US);
 }
 
-static bool ask(const char *sender, const char *action_id, gint64 deadline,
-                polkit_answer *out_answer, GError **error) {
-    g_autoptr(PolkitSubject) subject = polkit_system_bus_name_new(sender);
+static bool ask(const question &asked, polkit_answer *out_answer, GError **error) {
     g_autoptr(GError) first_error = nullptr;
 
-    if (ask_once(subject, action_id, deadline, out_answer, &first_error))
+    if (ask_once(asked, out_answer, &first_error))
         return true;
     if (client.authority == nullptr || !is_stale_owner(first_error)) {
         g_propagate_error(error, g_steal_pointer(&first_error));
         return false;
     }
-    await_owner(deadline);
-    return ask_once(subject, action_id, deadline, out_answer, error);
+    await_owner(asked.deadline);
+    return ask_once(asked, out_answer, error);
 }
 
-static bool ask_on_own_context(const char *sender, const char *action_id, gint64 deadline,
-                               polkit_answer *out_answer, GError **error) {
+// Polkit tells an action that no .policy file declares by its text alone.
+static bool is_undeclared(GError *error, const char *action_id) {
+    (void)g_dbus_error_strip_remote_error(error);  // A local error has nothing to strip.
+    g_autofree char *text = g_strdup_printf("Action %s is not registered", action_id);
+    return g_error_matches(error, POLKIT_ERROR, POLKIT_ERROR_FAILED) &&
+           std::strcmp(error->message, text) == 0;
+}
+
+// A unit's own action counts where it is declared. Where it is not, its parent decides, by rules
+// that look at the details.
+static bool ask_of_unit(const question &asked, polkit_answer *out_answer, GError **error) {
+    g_auto(unit_action) action = {};
+    g_autoptr(GError) cause = nullptr;
+
+    if (ask(asked, out_answer, &cause))
+        return true;
+    if (!is_undeclared(cause, asked.action_id) || !unit_action_parse(asked.action_id, &action)) {
+        g_propagate_error(error, g_steal_pointer(&cause));
+        return false;
+    }
+
+    g_autoptr(PolkitDetails) details = polkit_details_new();
+    polkit_details_insert(details, "action", asked.action_id);
+    polkit_details_insert(details, "unit", action.unit);
+    return ask({asked.sender, action.parent, details, asked.deadline}, out_answer, error);
+}
+
+static bool ask_on_own_context(const question &asked, polkit_answer *out_answer, GError **error) {
     if (!open_bus(error))
         return false;
     if (client.context == nullptr)
         client.context = g_main_context_new();
 
     g_main_context_push_thread_default(client.context);
-    const bool answered = ask(sender, action_id, deadline, out_answer, error);
+    const bool answered = ask_of_unit(asked, out_answer, error);
     g_main_context_pop_thread_default(client.context);
     return answered;
 }
@@ -221,7 +258,7 @@ bool polkit_client_check(const char *sender, const char *action_id, int deadline
     polkit_answer answer = polkit_answer::REFUSED;
     g_autoptr(GError) cause = nullptr;
 
-    if (!ask_on_own_context(sender, action_id, deadline, &answer, &cause)) {
+    if (!ask_on_own_context({sender, action_id, nullptr, deadline}, &answer, &cause)) {
         set_failure(action_id, deadline, cause, error);
         return false;
     }
