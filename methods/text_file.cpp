@@ -1,12 +1,12 @@
 // methods/text_file.cpp: reading a whole file for a reply.
 #include "methods/text_file.h"
 
+#include <array>
+#include <cerrno>
+
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
-
-#include <array>
-#include <cerrno>
 
 // A reply cannot carry more, so reading on would only fill the memory.
 static constexpr gsize MAX_SIZE = 32U << 20;

@@ -27,8 +27,10 @@ struct tool_result {
 void tool_result_clear(tool_result *result);
 G_DEFINE_AUTO_CLEANUP_CLEAR_FUNC(tool_result, tool_result_clear)
 
-// Runs the tool to its end. False, with an error of GLib's spawn domain and the wait status at -1,
-// when it could not be started. The vector ends with a null.
+// Runs the tool to its end, however long that takes and however much it prints. What it leaves
+// behind with a captured output still open is waited for too, and prints into the same text.
+// False, with an error of GLib's spawn domain and the wait
+// status at -1, when it could not be started. The vector ends with a null.
 bool run_tool(const char *const *argv, tool_capture capture, tool_result *result, GError **error);
 
 // Whether the tool ended by itself, with status 0.

@@ -23,3 +23,7 @@ bool pass_on(method_call &call, const char *prefix) {
     g_prefix_error(&call.error, "%s", prefix);
     return log_failure(call);
 }
+
+void connect_method(const char *signal, GCallback serve, ServiceState *state) {
+    (void)g_signal_connect_data(state->skeleton, signal, serve, state, nullptr, GConnectFlags(0));
+}

@@ -24,6 +24,9 @@ bool fail(method_call &call, int code, const char *format, ...) G_GNUC_PRINTF(3,
 // Puts a prefix before call.error, which a lower layer set, and logs it once. Always false.
 bool pass_on(method_call &call, const char *prefix);
 
+// Connects a function that serves a whole method.
+void connect_method(const char *signal, GCallback serve, ServiceState *state);
+
 // Text known at compile time that can be a template argument.
 template <std::size_t size>
 struct literal {
@@ -52,6 +55,16 @@ struct fixed_action {
     }
 };
 
+// The authorization of a method whose action depends on its arguments. The function checks them
+// first; it returns the action ID, or null with call.error set.
+template <auto action_id_of>
+struct derived_action {
+    static bool allows(method_call &call, auto... in) {
+        g_autofree char *action_id = action_id_of(call, in...);
+        return action_id != nullptr && privane_check_auth(call.invocation, action_id, &call.error);
+    }
+};
+
 template <typename authorization, auto work>
 struct served_method;
 
@@ -69,8 +82,7 @@ struct served_method<authorization, work> {
     }
 
     static void connect(const char *signal, ServiceState *state) {
-        g_signal_connect_data(state->skeleton, signal, G_CALLBACK(serve), state, nullptr,
-                              static_cast<GConnectFlags>(0));
+        connect_method(signal, G_CALLBACK(serve), state);
     }
 };
 
@@ -84,4 +96,10 @@ struct method_row {
 template <literal action, auto work>
 consteval method_row method(const char *signal) {
     return {signal, served_method<fixed_action<action>, work>::connect};
+}
+
+// The row of a method whose action depends on its arguments.
+template <auto action_id_of, auto work>
+consteval method_row method_with_derived_action(const char *signal) {
+    return {signal, served_method<derived_action<action_id_of>, work>::connect};
 }

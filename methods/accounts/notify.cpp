@@ -1,12 +1,12 @@
 // methods/accounts/notify.cpp: who learns of a change of the accounts.
 #include "methods/accounts/notify.h"
 
-#include <sys/types.h>
-#include <syslog.h>
-
 #include <cerrno>
 #include <climits>
 #include <csignal>
+
+#include <sys/types.h>
+#include <syslog.h>
 
 #include "methods/tool_runner.h"
 #include "platform/paramcli/paramcli.h"

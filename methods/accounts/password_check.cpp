@@ -3,11 +3,11 @@
 // The accounts are looked up through the C library, so that the files count as they stand on disk.
 #include "methods/accounts/password_check.h"
 
+#include <cstring>
+
 #include <crypt.h>
 #include <pwd.h>
 #include <shadow.h>
-
-#include <cstring>
 
 #include "service/method.h"
 

@@ -17,7 +17,7 @@ from harness.service import Service
 from harness.syslog_socket import SyslogSocket
 from harness.world import Neighbour
 
-pytest_plugins = ["harness.stage_fixtures"]
+pytest_plugins = ["harness.stage_fixtures", "harness.device_fixtures"]
 
 StartService = Callable[..., Service]
 

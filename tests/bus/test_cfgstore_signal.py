@@ -180,7 +180,7 @@ def test_pidof_inherits_nothing_but_its_three_descriptors(stage: Stage, tmp_path
 
     stage.succeed(*FTPD)
 
-    assert stage.pidof.descriptors() == [0, 1, 2]
+    assert list(stage.pidof.descriptors()) == [0, 1, 2]
     assert (tmp_path / "input").read_text() == "/dev/null\n"
 
 

@@ -3,7 +3,7 @@ import pytest
 from gi.repository import Gio
 
 from harness.bus import INTERFACE, NAME, PATH, UNKNOWN_METHOD, Bus, BusError, error_of
-from harness.interface import METHODS, NOT_IMPLEMENTED, SIGNAL, Method
+from harness.interface import METHODS, SIGNAL
 from harness.service import Service
 
 STANDARD_INTERFACES = {"org.freedesktop.DBus.Properties", "org.freedesktop.DBus.Introspectable",
@@ -74,13 +74,3 @@ def test_wrong_arguments_are_told(service: Service, bus: Bus) -> None:
     error = error_of(bus.call, "CheckUser", "u", 1)
 
     assert error.name == "org.freedesktop.DBus.Error.InvalidArgs"
-
-
-@pytest.mark.parametrize("method", [m for m in METHODS if m.member in NOT_IMPLEMENTED],
-                         ids=lambda method: method.member)
-def test_method_that_is_not_built_is_answered_so(method: Method, service: Service,
-                                                 bus: Bus) -> None:
-    error = error_of(bus.call, method.member, method.signature, *method.arguments)
-
-    assert error == BusError(UNKNOWN_METHOD, f"Method {method.member} is not implemented on "
-                                             f"interface {INTERFACE}")

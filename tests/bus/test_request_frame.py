@@ -1,18 +1,21 @@
 """tests/bus/test_request_frame.py: what every method does before its own work, and how it fails."""
+from pathlib import Path
+
 import pytest
 
-from harness.bus import UNKNOWN_METHOD, Bus, User, domain_error, error_of
+from harness.bus import Bus, BusError, User, domain_error, error_of
+from harness.device import Device
 from harness.fake_authz import CODE, DOMAIN, Check, FakeAuthz
-from harness.interface import IMPLEMENTED, METHODS, NOT_IMPLEMENTED, Method
+from harness.interface import METHODS, Method
 from harness.service import Service
+from harness.stage import Stage
 from harness.syslog_socket import SyslogSocket
 from harness.wire import Wire
 from harness.world import Neighbour, snapshot
 
 UNKNOWN = domain_error("privaneSystemError", 25, "Unknown")
 
-every_implemented_method = pytest.mark.parametrize("method", IMPLEMENTED,
-                                                   ids=lambda method: method.member)
+every_method = pytest.mark.parametrize("method", METHODS, ids=lambda method: method.member)
 
 
 def call(caller: Bus | User, method: Method) -> object:
@@ -25,15 +28,7 @@ def new_lines(service: Service, before: list[str]) -> list[str]:
     return output[len(before):]
 
 
-def test_list_of_missing_methods_is_exact(service: Service, bus: Bus, authz: FakeAuthz) -> None:
-    authz.refuse("not now")
-    missing = {method.member for method in METHODS
-               if error_of(call, bus, method).name == UNKNOWN_METHOD}
-
-    assert missing == NOT_IMPLEMENTED
-
-
-@every_implemented_method
+@every_method
 def test_refusal_is_answered_with_its_error(method: Method, service: Service, bus: Bus,
                                             authz: FakeAuthz) -> None:
     authz.refuse("not for you", "some-domain", 77)
@@ -42,7 +37,7 @@ def test_refusal_is_answered_with_its_error(method: Method, service: Service, bu
         "some-domain", 77, "Authorization check failed: not for you")
 
 
-@every_implemented_method
+@every_method
 def test_refusal_is_logged_once_as_a_warning(method: Method, service: Service, bus: Bus,
                                              authz: FakeAuthz, syslog: SyslogSocket) -> None:
     authz.refuse("not for you")
@@ -54,7 +49,7 @@ def test_refusal_is_logged_once_as_a_warning(method: Method, service: Service, b
     assert syslog.lines() == []
 
 
-@every_implemented_method
+@every_method
 def test_silent_refusal_is_unknown_and_not_logged(method: Method, service: Service, bus: Bus,
                                                   authz: FakeAuthz, syslog: SyslogSocket) -> None:
     authz.refuse_silently()
@@ -65,7 +60,7 @@ def test_silent_refusal_is_unknown_and_not_logged(method: Method, service: Servi
     assert syslog.lines() == []
 
 
-@every_implemented_method
+@every_method
 def test_refused_call_does_nothing_else(method: Method, service: Service, bus: Bus,
                                         authz: FakeAuthz, cfgstore: Neighbour) -> None:
     authz.refuse("not for you")
@@ -79,7 +74,19 @@ def test_refused_call_does_nothing_else(method: Method, service: Service, bus: B
     assert snapshot(cfgstore) == before
 
 
-@every_implemented_method
+@every_method
+def test_refused_call_reaches_no_library_tool_or_service(method: Method, hardware_clock: Path,
+                                                         system: Stage, device: Device,
+                                                         authz: FakeAuthz) -> None:
+    authz.refuse("not for you")
+    error_of(call, system.bus, method)
+    authz.refuse_silently()
+    error_of(call, system.bus, method)
+
+    assert system.calls() == []
+
+
+@every_method
 def test_refused_call_sends_no_signal(method: Method, service: Service, authz: FakeAuthz) -> None:
     authz.refuse("not for you")
     wire = Wire()
@@ -91,16 +98,19 @@ def test_refused_call_sends_no_signal(method: Method, service: Service, authz: F
         wire.close()
 
 
-@every_implemented_method
+@every_method
 def test_action_is_asked_once_for_the_caller(method: Method, service: Service, bus: Bus,
                                              authz: FakeAuthz) -> None:
     authz.forget()
-    call(bus, method)
+    try:
+        call(bus, method)
+    except BusError:
+        pass  # this machine is no device: some have nothing to work on
 
     assert authz.checks() == [Check(bus.unique_name, method.action_id)]
 
 
-@every_implemented_method
+@every_method
 def test_action_is_asked_once_where_it_is_refused(method: Method, service: Service, bus: Bus,
                                                   authz: FakeAuthz) -> None:
     authz.refuse("not for you")

@@ -25,6 +25,10 @@ class FakeFolder:
         directory.mkdir(parents=True, exist_ok=True)
         self.directory = directory
 
+    def environment(self) -> dict[str, str]:
+        """What a service's environment needs to use the fake."""
+        return {}
+
     def answer(self, name: str, content: str | bytes | int) -> None:
         """Makes one of the files that the fake obeys."""
         raw = content if isinstance(content, bytes) else str(content).encode()
@@ -78,12 +82,40 @@ class FakeParamcli(FakeFolder):
         self.answer("sync-error", number)
 
 
+class FakeBootparam(FakeFolder):
+    """A boot block that succeeds, and holds nothing, until told otherwise."""
+
+    def environment(self) -> dict[str, str]:
+        library = fake_library("bootparam/libbootparam.so.1")
+        return {"LD_LIBRARY_PATH": str(library.parent),
+                "FAKE_BOOTPARAM_DIRECTORY": str(self.directory)}
+
+    def fail(self, function: str, result: int, error: int = 0, errno: int = 0) -> None:
+        """function: "set-chip", "read" or "write"."""
+        self.answer("error", error)
+        self.answer("errno", errno)
+        self.answer(f"{function}-result", result)
+
+    def hold(self, value: str | bytes) -> None:
+        self.answer("value", value)
+
+
+class FakeRtcClock(FakeFolder):
+    """A hardware clock that succeeds until told otherwise."""
+
+    def environment(self) -> dict[str, str]:
+        library = fake_library("rtc_clock/librtcclock.so.1")
+        return {"LD_LIBRARY_PATH": str(library.parent),
+                "FAKE_RTC_CLOCK_DIRECTORY": str(self.directory)}
+
+
 class StandInTool(FakeFolder):
     """A program in a tool's place, which prints nothing and succeeds until told otherwise."""
 
     def __init__(self, path: str) -> None:
         self.path = Path(path)
         super().__init__(STAND_INS / self.path.name)
+        self.path.parent.mkdir(parents=True, exist_ok=True)
         self._aside = self.path.with_name(self.path.name + ".aside")
         if os.path.lexists(self.path) and not os.path.lexists(self._aside):
             self.path.rename(self._aside)
@@ -94,12 +126,20 @@ class StandInTool(FakeFolder):
     def print(self, output: str | bytes) -> None:
         self.answer("output", output)
 
+    def print_error(self, output: str | bytes) -> None:
+        self.answer("error-output", output)
+
     def exit_with(self, status: int) -> None:
         self.answer("status", status)
 
-    def descriptors(self) -> list[int]:
-        """Those with which its last run was started."""
-        return [int(line) for line in (self.directory / "descriptors").read_text().split()]
+    def descriptors(self) -> dict[int, str]:
+        """Those with which its last run was started, and what each leads to."""
+        lines = (self.directory / "descriptors").read_text().splitlines()
+        return {int(number): target for number, target in (line.split(" ", 1) for line in lines)}
+
+    def surroundings(self) -> bytes:
+        """The environment of its last run, as /proc/PID/environ shows it."""
+        return (self.directory / "environment").read_bytes()
 
     def remove(self) -> None:
         """The tool is not there at all."""
@@ -114,6 +154,8 @@ class StandInTool(FakeFolder):
         """Puts the tool back."""
         if not self.is_installed:
             return
+        if self.path.is_dir():
+            self.path.rmdir()
         self.path.unlink(missing_ok=True)
         if os.path.lexists(self._aside):
             self._aside.rename(self.path)

@@ -9,15 +9,6 @@ ACTION_PREFIX = "com.zintor.privane-system."
 
 SIGNAL = "UserDatabaseUpdated"
 
-# The members that the service does not serve yet. A method that is added is taken out here.
-NOT_IMPLEMENTED = frozenset((
-    "GetNetworkSpeedDuplex", "ReadLogFile", "SetTimeOfDay", "UpdateReleaseFile", "Reboot",
-    "RtspreadConfig", "Pinsrv", "AdjTime", "NotifyTimeSync", "ReadBootblockParam",
-    "AddBootblockParam", "ReadSerno", "StartNtp", "RestartNtp", "StopNtp", "StartLensd",
-    "StopLensd", "GetActiveNetworkInfo", "StartService", "StopService", "RestartService",
-    "ReloadService", "SetDefaultTarget", "GetSlabinfo", "ExecuteEthtool", "ExecuteSmartctl",
-    "ExecuteLldpcli"))
-
 
 @dataclass(frozen=True)
 class Method:
@@ -37,10 +28,6 @@ class Method:
     @property
     def action_id(self) -> str:
         return ACTION_PREFIX + self.action
-
-    @property
-    def is_implemented(self) -> bool:
-        return self.member not in NOT_IMPLEMENTED
 
 
 METHODS = (
@@ -96,8 +83,6 @@ METHODS = (
     Method("ExecuteSmartctl", ("s", "s"), ("s",), "executesmartctl", ("all", "/dev/sda")),
     Method("ExecuteLldpcli", ("s",), ("s",), "executelldpcli", ("show-neighbors",)),
 )
-
-IMPLEMENTED = tuple(method for method in METHODS if method.is_implemented)
 
 # The methods that change nothing.
 QUERIES = tuple(method for method in METHODS if method.member in (

@@ -57,3 +57,9 @@ def wait_for_child(pid: int, seconds: float) -> int | None:
         if time.monotonic() > end:
             return None
         time.sleep(0.002)
+
+
+def end(pid: int) -> None:
+    """Kills a child."""
+    os.kill(pid, signal.SIGKILL)
+    assert wait_for_child(pid, 5) == -signal.SIGKILL

@@ -2,11 +2,11 @@
 import signal
 from dataclasses import dataclass, field
 from pathlib import Path
-from typing import Any, Callable, Sequence
+from typing import Any, Callable, Protocol, Sequence
 
 from harness.bus import Bus, BusError, domain_error
 from harness.fake_authz import FakeAuthz
-from harness.fake_folder import FakeDigest, FakeParamcli, StandInTool, together
+from harness.fake_folder import Call, FakeDigest, FakeParamcli, StandInTool, together
 from harness.interface import METHODS
 from harness.passwords import MARK
 from harness.service import Service
@@ -29,6 +29,16 @@ LOG_ERR, LOG_WARNING = 3, 4
 SIGNATURES = {method.member: method.signature for method in METHODS}
 
 
+class Fake(Protocol):
+    """What keeps a record of its calls."""
+
+    def environment(self) -> dict[str, str]: ...
+
+    def calls(self) -> list[Call]: ...
+
+    def forget(self) -> None: ...
+
+
 @dataclass
 class Effects:
     """All that came of one call: the answer, the messages that reached a bus client in their order,
@@ -49,11 +59,12 @@ def refused(domain: str, code: int, text: str) -> Effects:
 
 
 class Stage:
-    """The service with a fake libauthz, fake or our own stores behind it, a stand-in for pidof, and
-    a process named cfgstore that pidof finds."""
+    """The service with a fake libauthz, fake or our own stores behind it, a stand-in for pidof, a
+    process named cfgstore that pidof finds, and other fakes, which their maker closes."""
 
     def __init__(self, start: Callable[..., Service], bus: Bus, authz: FakeAuthz,
-                 syslog: SyslogSocket, directory: Path, fake_stores: bool = True) -> None:
+                 syslog: SyslogSocket, directory: Path, fake_stores: bool = True,
+                 others: Sequence[Fake] = ()) -> None:
         self.bus = bus
         self.syslog = syslog
         self.digest = FakeDigest(directory / "digest")
@@ -63,8 +74,9 @@ class Stage:
         self.pidof.print(f"{self.cfgstore.pid}\n")
         self._start = start
         stores = (self.digest, self.params) if fake_stores else ()
+        self._fakes: tuple[Fake, ...] = (self.digest, self.params, self.pidof, *others)
         self._environment = together(authz.environment(),
-                                     *(store.environment() for store in stores))
+                                     *(fake.environment() for fake in (*stores, *others)))
         self._runs: list[Service] = []
         self._shown: list[str] = []
         self.start()
@@ -104,11 +116,11 @@ class Stage:
 
     def calls(self) -> list[tuple[str, ...]]:
         """The calls of the fakes, in the order in which they were made."""
-        calls = [call for fake in (self.digest, self.params, self.pidof) for call in fake.calls()]
+        calls = [call for fake in self._fakes for call in fake.calls()]
         return [call.words for call in sorted(calls, key=lambda call: call.time)]
 
     def _forget(self) -> None:
-        for fake in (self.digest, self.params, self.pidof):
+        for fake in self._fakes:
             fake.forget()
         self.syslog.forget()
         if self.cfgstore.signals():

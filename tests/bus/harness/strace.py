@@ -1,9 +1,12 @@
 """tests/bus/harness/strace.py: the system calls of a run of the service."""
 import re
+import signal
+import subprocess
 from dataclasses import dataclass
 from pathlib import Path
 
 from harness import process
+from harness.deadline import wait_for
 
 LINE = re.compile(r"(?P<pid>\d+) +(?P<name>\w+)\((?P<rest>.*)")
 
@@ -37,3 +40,35 @@ class Trace:
         self.wait_complete()
         return [SystemCall(int(match["pid"]), match["name"], match["rest"])
                 for match in map(LINE.match, self._file.read_text().splitlines()) if match]
+
+
+class Attached:
+    """A tracer of a service that runs already; a context manager. inject is a clause of strace's,
+    such as "socket:error=EMFILE": the calls that it names are not made."""
+
+    def __init__(self, pid: int, file: Path, calls: str, inject: str = "") -> None:
+        self._pid = pid
+        self._file = file
+        self._command = ["strace", "-f", "-qq", "-s", "256", "-p", str(pid), "-o", str(file),
+                         "-e", f"trace={calls}", *(["-e", f"inject={inject}"] if inject else [])]
+
+    def __enter__(self) -> "Attached":
+        self._tracer = subprocess.Popen(self._command)
+        wait_for("strace to attach", self._is_attached)
+        return self
+
+    def __exit__(self, *_: object) -> None:
+        self._tracer.send_signal(signal.SIGINT)
+        self._tracer.wait(5)
+
+    def _is_attached(self) -> bool:
+        assert self._tracer.poll() is None, "strace cannot attach"
+        tasks = Path(f"/proc/{self._pid}/task").iterdir()
+        return all(process.status(int(task.name))["TracerPid"] == str(self._tracer.pid)
+                   for task in tasks)
+
+    def calls(self) -> list[str]:
+        """What strace printed, after its end, a line for each call without the process's number;
+        runs of blanks are one."""
+        return [re.sub(r" +", " ", line.split(maxsplit=1)[1])
+                for line in self._file.read_text().splitlines()]

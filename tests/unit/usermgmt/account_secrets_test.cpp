@@ -22,16 +22,6 @@
 #include "usermgmt/record_check.h"
 #include "usermgmt/usermgmt.h"
 
-template <std::size_t size>
-struct veiled_literal {
-    char text[size];
-
-    consteval explicit veiled_literal(const char (&literal)[size]) : text{} {
-        std::transform(literal, literal + size, text, veil);
-    }
-    std::string string() const { return {text, size - 1}; }
-};
-
 static constexpr veiled_literal PASSWORD("Tr0ub4dor-and-3-Staples");
 static constexpr veiled_literal OTHER_PASSWORD("correct-Horse-and-Battery");
 static constexpr veiled_literal HASH("$5$ZZZZZZZZZZZZ$zudeleVaZfzgzvtsL.HxHI5hndEd6eifjOotGYM6oD5");
