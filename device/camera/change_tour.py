@@ -36,6 +36,7 @@ def walk_through_changes(show: Transcript) -> None:
     _show_removed_user(show)
     _show_refusals(show)
     _show_who_was_told(show)
+    _show_other_additions(show)
 
 
 def _show_new_user(show: Transcript) -> None:
@@ -144,6 +145,22 @@ def _show_who_was_told(show: Transcript) -> None:
     show.step(["journalctl", "-u", UNIT, "-o", "cat", "-p", "notice..warning", "-n", "7"],
               shows=["Sent SIGUSR1 to cfgstore", "User deletion failed, user type could not be"],
               says="The service's own words on the last calls.")
+
+
+def _show_other_additions(show: Transcript) -> None:
+    show.chapter("Other ways to add a user")
+    show.step(call("AddUidUser", "bert", "Foggy-5", "users", "", "", "5000"), shows=["()\n"],
+              says="Like AddUser, with a UID of the caller's choice.")
+    show.step(["id", "-u", "bert"], shows=["5000\n"], says="It was free, so he has it.")
+    show.step(call("AddSystemUser", "technician", "Sunny-7", "users", "['audio']", "/bin/sh",
+                   "Field service"), shows=["()\n"],
+              says="A user of the system: with a shell, and unknown to the web server.")
+    show.step(call("ClearUserFields", "technician", "true", "true", "true"), shows=["()\n"],
+              says="Password, other groups and comment are taken away.")
+    show.step(call("GetUser", "technician"), shows=["(false, 'users', @as [], '', "],
+              says="Nobody logs in as technician now.")
+    for name in ("bert", "technician"):
+        show.step(call("RemoveUser", name), shows=["()\n"], says="Gone again.")
 
 
 def _ends(lines: str) -> list[str]:

@@ -8,11 +8,15 @@ from pathlib import Path
 from .host_tool import run_tool
 from .layer_cache import LayerCache, files_below, key_of
 from .paths import DEVICE
+from .storage_disk import STORAGE_RECIPE, make_storage_disk
+
+# The root file system, and the disk with the boot block.
+DISKS = ("root", "storage")
 
 
 @dataclass(frozen=True)
 class Image:
-    """A disk image, and the kernel that boots it."""
+    """The disk images, and the kernel that boots them."""
 
     cache: LayerCache
     folder: Path
@@ -26,10 +30,9 @@ class Image:
     def initrd(self) -> Path:
         return self.base / "initrd.img"
 
-    @property
-    def disk_from_beside(self) -> str:
-        """The disk as seen from any folder beside its own: it stays true when the tree is moved."""
-        return f"../{self.folder.name}/root.img"
+    def disk_from_beside(self, name: str) -> str:
+        """A disk as seen from any folder beside its own: it stays true when the tree is moved."""
+        return f"../{self.folder.name}/{name}.img"
 
 
 def make_image(cache: LayerCache, base: Path, build: Path) -> Image:
@@ -38,7 +41,7 @@ def make_image(cache: LayerCache, base: Path, build: Path) -> Image:
     shutil.rmtree(installed, ignore_errors=True)
     run_tool("meson", "install", "-C", build, "--no-rebuild", "--quiet", "--destdir", installed)
     recipe = [*files_below(installed), *files_below(DEVICE / "guest")]
-    recipe.append(("assemble_image", DEVICE / "assemble_image"))
+    recipe += [(path.name, path) for path in (DEVICE / "assemble_image", STORAGE_RECIPE)]
     folder = cache.layer("image", key_of(recipe, base.name),
                          "installing the service in the camera's image",
                          lambda work: _fill(work, base, installed))
@@ -52,3 +55,4 @@ def _fill(work: Path, base: Path, installed: Path) -> None:
     pretend = [] if os.geteuid() == 0 else ["fakeroot"]
     run_tool(*pretend, DEVICE / "assemble_image", base, installed, root, work / "root.img")
     shutil.rmtree(root)
+    make_storage_disk(work / "storage.img")

@@ -3,7 +3,7 @@ channels, and what scripts and tests ask of them."""
 import hashlib
 import socket
 import subprocess
-from collections.abc import Iterator, Sequence
+from collections.abc import Iterator, Mapping, Sequence
 from contextlib import ExitStack, contextmanager
 from pathlib import Path
 from typing import Any
@@ -11,7 +11,7 @@ from typing import Any
 from .deadline import Deadline
 from .errors import CameraError
 from .host_tool import run_tool
-from .image_layer import Image
+from .image_layer import DISKS, Image
 from .qmp import Qmp
 from .root_shell import Result, RootShell
 
@@ -34,6 +34,9 @@ def devices(kvm: bool) -> list[str]:
     words += ["-rtc", "base=utc,clock=vm", "-append", KERNEL_LINE]
     words += ["-serial", "chardev:serial", "-mon", "chardev=qmp,mode=control"]
     words += ["-device", "virtio-blk-pci,drive=root"]
+    # /dev/sda, a disk that knows SMART; and eth0 with a link, on a network of nobody else.
+    words += ["-device", "ide-hd,bus=ide.0,drive=storage"]
+    words += ["-netdev", "hubport,id=lan,hubid=0", "-device", "e1000,netdev=lan"]
     words += ["-device", "virtio-serial-pci", "-device", "virtconsole,chardev=shell"]
     words += ["-device", "virtio-rng-pci"]
     return words
@@ -48,19 +51,20 @@ def machine_key(kvm: bool) -> str:
 class Camera:
     """A running camera. Use it in a `with` block: leaving it ends QEMU and removes its files."""
 
-    def __init__(self, image: Image, *, disk: Path | None = None, snapshot: str = "",
-                 kvm: bool = False) -> None:
-        """Boots the image, or goes on from the named snapshot that the qcow2 file `disk` holds."""
+    def __init__(self, image: Image, *, disks: Mapping[str, Path] | None = None,
+                 snapshot: str = "", kvm: bool = False) -> None:
+        """Boots the image, or goes on from the named snapshot that the qcow2 files hold."""
         self._cleanup = ExitStack()
         self._folder = self._cleanup.enter_context(image.cache.run_folder())
-        self.disk = self._folder / "root.qcow2"
+        self.disks = {name: self._folder / f"{name}.qcow2" for name in DISKS}
         try:
-            if disk is None:
-                run_tool("qemu-img", "create", "-q", "-f", "qcow2", "-F", "raw",
-                         "-b", image.disk_from_beside, self.disk)
-            else:
-                # A copy: this run takes snapshots in it, and its crash harms no other.
-                run_tool("cp", "--reflink=auto", "--sparse=always", disk, self.disk)
+            for name, path in self.disks.items():
+                if disks is None:
+                    run_tool("qemu-img", "create", "-q", "-f", "qcow2", "-F", "raw",
+                             "-b", image.disk_from_beside(name), path)
+                else:
+                    # A copy: this run takes snapshots in it, and its crash harms no other.
+                    run_tool("cp", "--reflink=auto", "--sparse=always", disks[name], path)
             self._process = self._launch(image, snapshot, kvm)
             with self._explained():
                 self._wait_until_up(booting=not snapshot)
@@ -73,10 +77,11 @@ class Camera:
         ours_shell, qemus_shell = socket.socketpair()
         self.qmp = Qmp(ours_qmp)
         self.shell = RootShell(ours_shell)
-        drive = f"if=none,id=root,format=qcow2,cache=unsafe,file={_escaped(self.disk)}"
         # setpriv: the machine dies with us, however we die.
         argv = ["setpriv", "--pdeathsig", "KILL", "--", QEMU, *devices(kvm)]
-        argv += ["-kernel", str(image.kernel), "-initrd", str(image.initrd), "-drive", drive]
+        argv += ["-kernel", str(image.kernel), "-initrd", str(image.initrd)]
+        for name, path in self.disks.items():
+            argv += ["-drive", f"if=none,id={name},format=qcow2,cache=unsafe,file={_escaped(path)}"]
         argv += ["-chardev", f"file,id=serial,path={_escaped(self._folder / 'serial.log')}"]
         argv += ["-chardev", f"socket,id=qmp,fd={qemus_qmp.fileno()}"]
         argv += ["-chardev", f"socket,id=shell,fd={qemus_shell.fileno()}"]
@@ -146,8 +151,16 @@ class Camera:
         with self._explained():
             deadline = Deadline(BOOT_SECONDS, "booting the camera after a power cut")
             self.qmp.execute("system_reset", deadline)
-            self.qmp.wait_for_event("RESET", deadline)
-            self._wait_until_booted(deadline)
+            self._wait_until_rebooted(deadline)
+
+    def wait_for_reboot(self) -> None:
+        """Returns when the camera, which is about to reboot by itself, is up again."""
+        with self._explained():
+            self._wait_until_rebooted(Deadline(BOOT_SECONDS, "waiting for the camera to reboot"))
+
+    def _wait_until_rebooted(self, deadline: Deadline) -> None:
+        self.qmp.wait_for_event("RESET", deadline)
+        self._wait_until_booted(deadline)
 
     def power_off(self, timeout: float = 60) -> dict[str, Any]:
         """Presses the power button, waits until QEMU is gone, and returns its event about it."""

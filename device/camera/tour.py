@@ -2,6 +2,7 @@
 from .bus_call import METHODS, NAME, OBJECT, UNIT, USERMGMT_ERROR, call, strings_in
 from .change_tour import walk_through_changes
 from .machine import Camera
+from .system_tour import walk_through_system
 from .transcript import Transcript, sync_journal
 
 RULES = "/usr/share/doc/privane-system/examples/60-privane-viewer.rules"
@@ -27,6 +28,7 @@ class Tour(Transcript):
         self._show_authorization()
         self._show_bus_policy()
         self._show_activation()
+        walk_through_system(self)
 
     def _show_unit(self) -> None:
         self.chapter("The service in the camera")

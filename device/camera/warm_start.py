@@ -1,10 +1,11 @@
 """device/camera/warm_start.py: from a build to a running camera in the shortest time: the layers,
 one boot for each image, and from then on the snapshot that was saved after it."""
 import os
+from collections.abc import Mapping
 from pathlib import Path
 
 from .base_layer import make_base
-from .image_layer import Image, make_image
+from .image_layer import DISKS, Image, make_image
 from .layer_cache import LayerCache
 from .machine import Camera, machine_key
 
@@ -19,16 +20,17 @@ def start_camera(cache: LayerCache, build: Path, *, kvm: bool = False,
         if fresh:
             cache.clear()
         image = make_image(cache, make_base(cache), build)
-        warm = image.folder / f"booted-{machine_key(kvm)}.qcow2"
-        if not warm.exists():
+        warm = {name: image.folder / f"{name}-booted-{machine_key(kvm)}.qcow2" for name in DISKS}
+        if not all(path.exists() for path in warm.values()):
             _boot_once(image, warm, kvm)
         cache.say("starting the camera")
-        return Camera(image, disk=warm, snapshot=BOOTED, kvm=kvm)
+        return Camera(image, disks=warm, snapshot=BOOTED, kvm=kvm)
 
 
-def _boot_once(image: Image, warm: Path, kvm: bool) -> None:
+def _boot_once(image: Image, warm: Mapping[str, Path], kvm: bool) -> None:
     image.cache.say("booting the camera for the first time (about a quarter of a minute)")
     with Camera(image, kvm=kvm) as camera:
         camera.save(BOOTED)
         camera.quit()
-        os.rename(camera.disk, warm)
+        for name, path in camera.disks.items():
+            os.rename(path, warm[name])

@@ -5,9 +5,11 @@ from camera.machine import Camera
 INSTALLED = (
     "/usr/sbin/privane_system",
     "/usr/lib/x86_64-linux-gnu/libauthz.so.1",
+    "/usr/lib/x86_64-linux-gnu/libbootparam.so.1",
     "/usr/lib/x86_64-linux-gnu/libdigestentry.so.1",
     "/usr/lib/x86_64-linux-gnu/liblogbackend.so.1",
     "/usr/lib/x86_64-linux-gnu/libparamcli.so.1",
+    "/usr/lib/x86_64-linux-gnu/librtcclock.so.1",
     "/usr/lib/systemd/system/privane-system.service",
     "/usr/lib/sysusers.d/privane-system.conf",
     "/usr/share/dbus-1/interfaces/com.zintor.PrivaneSystem.xml",
@@ -38,7 +40,7 @@ def test_system_accounts_have_the_ids_of_a_type(camera: Camera) -> None:
 
 
 def test_every_library_is_there(camera: Camera) -> None:
-    shown = camera.run(["ldd", *INSTALLED[:5]]).check().out
+    shown = camera.run(["ldd", *INSTALLED[:7]]).check().out
     assert "libauthz.so.1 => /" in shown
     assert "not found" not in shown
 

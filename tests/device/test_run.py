@@ -1,5 +1,6 @@
 """tests/device/test_run.py: ./run as a newcomer would start it."""
 import os
+import re
 import subprocess
 import sys
 import time
@@ -9,7 +10,7 @@ import pytest
 from camera.errors import CameraError
 from camera.machine import Camera
 from camera.paths import DEVICE, TREE
-from camera.tour import NAME, UNIT, Tour
+from camera.tour import METHODS, NAME, UNIT, Tour
 from terminal import Terminal
 
 PROMPT = "root@camera:/#"
@@ -41,6 +42,10 @@ def test_without_a_terminal(build_dir: Path) -> None:
                  "+anna:x:1000:100:Anna at the desk::/bin/false", "UserDatabaseUpdated ()",
                  "powering the camera off"):
         assert text in done.stdout
+    interface = (TREE / f"service/{NAME}.xml").read_text()
+    methods = re.findall(r'<method name="(\w+)"', interface)
+    assert len(methods) == METHODS
+    assert [method for method in methods if f"-m {NAME}.{method}" not in done.stdout] == []
     # What was made before is used again, which is why a later start takes seconds.
     for text in ("making the camera's root file system", "booting the camera for the first time"):
         assert text not in done.stdout
