@@ -25,5 +25,6 @@ bool pass_on(method_call &call, const char *prefix) {
 }
 
 void connect_method(const char *signal, GCallback serve, ServiceState *state) {
-    (void)g_signal_connect_data(state->skeleton, signal, serve, state, nullptr, GConnectFlags(0));
+    (void)g_signal_connect_data(state->skeleton, signal, serve, state, nullptr,
+                                static_cast<GConnectFlags>(0));
 }

@@ -1,7 +1,7 @@
 // service/method_table.cpp: the methods that the service answers, in the order of the interface.
 #include "service/method_table.h"
 
-#include <array>
+#include <iterator>
 
 #include "methods/accounts/digest.h"
 #include "methods/accounts/group_changes.h"
@@ -17,7 +17,7 @@
 #include "service/method.h"
 
 // AddSystemUser is guarded by the action of AddUser.
-static constexpr std::array method_table = {
+static constexpr method_row method_table[] = {
     method<"getnetworkspeedduplex", handle_get_network_speed_duplex>(
         "handle-get-network-speed-duplex"),
     method<"readlogfile", handle_read_log_file>("handle-read-log-file"),
@@ -69,7 +69,7 @@ static constexpr std::array method_table = {
 };
 
 static constexpr std::size_t IMPLEMENTED_METHODS = 46;
-static_assert(method_table.size() == IMPLEMENTED_METHODS);
+static_assert(std::size(method_table) == IMPLEMENTED_METHODS);
 
 void connect_methods(ServiceState *state) {
     for (const method_row &row : method_table)

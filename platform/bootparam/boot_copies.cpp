@@ -23,7 +23,7 @@ static constexpr std::size_t FLAG_LETTERS = 2;
 
 static constexpr const char *LOCK = "/var/lock/fw_printenv.lock";
 static constexpr int LOCK_TRIES = 300;
-static constexpr struct timespec LOCK_PAUSE = {0, 10 * 1000 * 1000};
+static constexpr struct timespec LOCK_PAUSE = {0, 10'000'000};
 
 boot_copies::~boot_copies() {
     const int saved_errno = errno;
@@ -80,7 +80,8 @@ std::size_t boot_copies::capacity() const {
 // The list ends with a NUL, as does what stands before it.
 static std::size_t flags_in(std::string_view text) {
     std::size_t longest = 0;
-    for (std::size_t at = text.find(FLAGS); at != text.npos; at = text.find(FLAGS, at + 1)) {
+    for (std::size_t at = text.find(FLAGS); at != std::string_view::npos;
+         at = text.find(FLAGS, at + 1)) {
         const std::string_view list = text.substr(at, text.find('\0', at) - at);
         const auto commas = static_cast<std::size_t>(std::count(list.begin(), list.end(), ','));
         longest = std::max(longest, list.size() + 1 + FLAG_LETTERS * (commas + 1));
