@@ -234,9 +234,7 @@ TEST_F(BootParamConfig, WritersLoseNothing) {
 
 // A caller who could open the lock could keep every other from the boot block.
 TEST_F(BootParamConfig, PackagedLockIsTheOneThatIsTaken) {
-    const char *rules = g_getenv("TMPFILES_OF_THE_PACKAGE");
-    ASSERT_NE(rules, nullptr);
-    EXPECT_NE(read_file(rules).find(std::string("\nf ") + LOCK + " 0600 root root -\n"),
+    EXPECT_NE(read_file(TMPFILES_RULES).find(std::string("\nf ") + LOCK + " 0600 root root -\n"),
               std::string::npos);
     struct stat lock = {};
     ASSERT_NE(stat(LOCK, &lock), 0);
