@@ -82,7 +82,7 @@ def test_service_runs_the_installed_binary_with_the_library_in_front(
 
     assert os.readlink(f"/proc/{service.pid}/exe") == BINARY
     assert {line.split()[-1] for line in maps.splitlines() if "libauthz" in line} == {
-        str(authz.library)}
+        str(authz.path)}
     assert "liblogbackend.so.1" in maps
 
 

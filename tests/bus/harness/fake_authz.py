@@ -19,16 +19,17 @@ class FakeAuthz:
 
     def __init__(self, directory: Path) -> None:
         self._directory = directory
-        self._library = fake_library("authz/libauthz.so.1")
+        self._path = fake_library("authz/libauthz.so.1")
         self.allow()
 
     def environment(self) -> dict[str, str]:
-        return {"LD_LIBRARY_PATH": str(self._library.parent),
+        return {"LD_LIBRARY_PATH": str(self._path.parent),
                 "FAKE_AUTHZ_DIRECTORY": str(self._directory)}
 
     @property
-    def library(self) -> Path:
-        return self._library
+    def path(self) -> Path:
+        """Of the library itself."""
+        return self._path
 
     def _answer(self, verdict: str) -> None:
         new = self._directory / "verdict.new"
