@@ -130,7 +130,7 @@ def clerk(privane_gid: int) -> Iterator[User]:
 
 
 @pytest.fixture(scope="session")
-def stranger() -> Iterator[User]:
+def stranger(account_files: AccountFiles) -> Iterator[User]:
     """A user outside the group privane."""
     yield from make_user(STRANGER_UID)
 
