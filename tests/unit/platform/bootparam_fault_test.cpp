@@ -4,6 +4,7 @@
 #include <csignal>
 #include <cstdlib>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <malloc.h>
@@ -160,6 +161,16 @@ TEST_F(BootParamFault, FailingSyncIsAFailure) {
     EXPECT_EQ(read("a"), "=" + OLD);
 }
 
+// Flash is written through; its devices answer a sync with EINVAL.
+TEST_F(BootParamFault, DeviceWithoutSyncIsWritten) {
+    const write_fault fault = {0, EINVAL, true};
+    planned = &fault;
+    const std::string outcome = BootParam::write("a", NEW);
+    planned = nullptr;
+    EXPECT_EQ(outcome, "ok");
+    EXPECT_EQ(read("a"), "=" + NEW);
+}
+
 // errno tells of the failure, and not of what came after it.
 TEST_F(BootParamFault, FailingUnlockChangesNothing) {
     unlock_fails = true;
@@ -186,14 +197,16 @@ TEST_F(BootParamFault, ReadOnlyBlockIsReadAndSaysWhyItIsNotWritten) {
 // libubootenv writes a buffer that it does not clear.
 TEST_F(BootParamFault, FreedMemoryDoesNotReachTheBlock) {
     const std::string secret = "secret-of-a-caller";
-    std::vector<std::string *> blocks;
+    // A small piece behind each block keeps the heap from shrinking when the blocks are freed.
+    std::vector<std::pair<std::string *, std::string *>> blocks;
     for (int i = 0; i < 8; i++) {
-        std::string *block = new std::string;
-        while (block->size() < 3 * COPY_SIZE)
+        auto *block = new std::string;
+        block->reserve(3 * COPY_SIZE);
+        while (block->size() + secret.size() <= block->capacity())
             *block += secret;
-        blocks.push_back(block);
+        blocks.emplace_back(block, new std::string(64, 'x'));
     }
-    for (const std::string *block : blocks)
+    for (const auto &[block, behind] : blocks)
         delete block;
 
     EXPECT_EQ(BootParam::write("a", "1"), "ok");
@@ -203,6 +216,8 @@ TEST_F(BootParamFault, FreedMemoryDoesNotReachTheBlock) {
         ASSERT_EQ(bytes.size(), COPY_SIZE);
         EXPECT_EQ(bytes.find(secret.substr(0, 8)), std::string::npos);
     }
+    for (const auto &[block, behind] : blocks)
+        delete behind;
 }
 
 // What is in use, where the C library's own allocator tells.
