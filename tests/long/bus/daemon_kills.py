@@ -1,0 +1,91 @@
+"""tests/long/bus/daemon_kills.py: proof: no kill of the service costs an account.
+
+The service is killed right before each call on the file system that a change makes, on files in
+three states, and at random moments under load. One point is one kill, judged, with the start after
+it and the killed call made again. One in ten is a random one, and all that are left when every
+boundary was struck.
+"""
+import random
+from collections import Counter
+from typing import Iterator
+
+import pytest
+
+from harness.accounts import AccountFiles
+from harness.bus import Bus
+from harness.fake_authz import FakeAuthz
+from harness.service_fixtures import StartService
+from harness.syslog_socket import SyslogSocket
+from kill_load import KillLoad
+from kill_points import LEFTOVERS, KillPoints, Point
+from killed_service import KilledService
+from temporary_watch import TemporaryWatch
+
+# The random kills begin so often with the files as they were at first.
+KILLS_BETWEEN_FRESH = 20
+
+
+@pytest.fixture
+def killed(start: StartService, bus: Bus, authz: FakeAuthz, syslog: SyslogSocket,
+           accounts: AccountFiles) -> KilledService:
+    return KilledService(start, bus, authz, syslog, accounts)
+
+
+@pytest.fixture
+def watch(killed: KilledService) -> Iterator[TemporaryWatch]:
+    """Somebody else looks at every temporary file of a file that is not everybody's."""
+    watching = TemporaryWatch()
+    yield watching
+    watching.close()
+
+
+def chosen(points: list[Point], most: int, chance: random.Random) -> list[Point]:
+    """All where there is room; else those around which a file changes, then every boundary in one
+    of the states, then the others."""
+    if len(points) <= most:
+        return points
+    chance.shuffle(points)
+    seen: set[tuple[str, str, int]] = set()
+    ranks = {}
+    for point in points:
+        boundary = (point.change, point.call, point.number)
+        ranks[point] = 0 if point.changes_a_file and point.state == "clean" else (
+            2 if boundary in seen else 1)
+        seen.add(boundary)
+    return sorted(points, key=lambda point: ranks[point])[:most]
+
+
+def test_kill_at_every_boundary(killed: KilledService, watch: TemporaryWatch, amount: int,
+                                chance: random.Random, figures: Counter[str]) -> None:
+    kills = KillPoints(killed)
+    all_points = kills.all_points()
+    points = chosen(all_points, amount - max(1, amount // 10), chance)
+    left: dict[str, set[str]] = {}
+    for point in points:
+        leftovers = kills.strike(point)
+        left.setdefault(point.change, set()).update(leftovers)
+        figures["points"] += 1
+        figures["boundary_points"] += 1
+    assert points
+    figures["max_boundary_points"] = len(all_points)
+    for change, lines in left.items():
+        assert lines <= LEFTOVERS.get(change, set()), (change, lines)
+    if len(points) == len(all_points):
+        assert left == {change: LEFTOVERS.get(change, set()) for change in left}
+    watch.require_nothing_read()
+
+
+def test_kill_at_random(killed: KilledService, watch: TemporaryWatch, amount: int,
+                        chance: random.Random, figures: Counter[str]) -> None:
+    load = KillLoad(killed, chance, figures)
+    try:
+        for number in range(amount - figures["boundary_points"]):
+            if number % KILLS_BETWEEN_FRESH == 0:
+                load.begin_afresh()
+            load.strike()
+            figures["points"] += 1
+            figures["random_kills"] += 1
+    finally:
+        load.close()
+    assert load.answered + load.unanswered > 0
+    watch.require_nothing_read()
