@@ -15,6 +15,7 @@ RUNS = {
     "unit": ["unit.xml", "unit-sanitizers.xml", "unit-valgrind-*.xml"],
     "bus": ["bus.xml"],
     "device": ["device.xml"],
+    "proof": ["proof.xml"],
 }
 
 

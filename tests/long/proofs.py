@@ -1,0 +1,121 @@
+"""tests/long/proofs.py: the proofs, how each is started, and how much of each is wanted.
+
+A proof is a command that takes --amount N, --seed S and --figures FILE. It does about N of its unit,
+draws everything random from the seed, and writes its counts to FILE as a JSON object, where names that
+begin with "max_" are maxima and all others are sums. Exit status 0 tells that nothing failed.
+"""
+import json
+import subprocess
+import sys
+import tempfile
+import time
+from dataclasses import dataclass
+from pathlib import Path
+
+TREE = Path(__file__).resolve().parents[2]
+
+Counts = dict[str, int | float]
+
+
+@dataclass(frozen=True)
+class Proof:
+    """unit is the count by which a proof is measured. gate is the amount of ./test proof, step that
+    of one start in a long run, aim what one night should reach, and full what many should."""
+
+    name: str
+    command: tuple[str, ...]
+    unit: str
+    gate: int
+    step: int
+    aim: int
+    full: int
+    build: str = "build"
+    # A proof that keeps both cores busy, or measures time, has the machine to itself.
+    cores: int = 1
+
+
+@dataclass(frozen=True)
+class Outcome:
+    passed: bool
+    counts: Counts
+    output: str
+    seconds: float
+
+
+def on_bus(name: str, build: str = "build") -> tuple[str, ...]:
+    return ("tests/long/on_bus", f"--build={build}", name)
+
+
+PROOFS: tuple[Proof, ...] = (
+    Proof("kill_points", ("build/tests/long/faults/kill_points",), "points",
+          gate=2_500, step=20_000, aim=200_000, full=2_000_000),
+    Proof("failing_calls", ("build/tests/long/faults/failing_calls",), "faults",
+          gate=6_000, step=20_000, aim=50_000, full=500_000),
+    Proof("daemon_kills", on_bus("daemon_kills"), "points",
+          gate=300, step=1_000, aim=12_500, full=25_000),
+    Proof("power_cuts", ("tests/long/power/power_cuts",), "states",
+          gate=3_000, step=10_000, aim=50_000, full=250_000, cores=2),
+    Proof("fuzzing", ("tests/fuzz/run",), "seconds",
+          gate=10, step=60, aim=480, full=2_400, build="build-fuzz", cores=2),
+    Proof("bus_fuzzing", on_bus("bus_fuzzing", "build-sanitize"), "calls",
+          gate=46_000, step=46_000, aim=460_000, full=1_000_000, build="build-sanitize"),
+    Proof("authorization_matrix", on_bus("authorization_matrix"), "cells",
+          gate=368, step=368, aim=1_104, full=3_680),
+    Proof("races", on_bus("races"), "trials",
+          gate=5_000, step=5_000, aim=25_000, full=100_000),
+    Proof("soak", on_bus("soak"), "seconds",
+          gate=60, step=600, aim=1_800, full=28_800),
+    Proof("flood", on_bus("flood"), "seconds",
+          gate=10, step=60, aim=60, full=600),
+    Proof("daemon_secrets", on_bus("daemon_secrets"), "calls",
+          gate=400, step=400, aim=2_000, full=20_000),
+    Proof("seeded_defects", ("tests/long/seeded/run",), "defects",
+          gate=8, step=8, aim=8, full=8, cores=2),
+)
+
+
+def named(names: list[str]) -> list[Proof]:
+    """All of them without a name; ends the program at an unknown one."""
+    if unknown := set(names) - {proof.name for proof in PROOFS}:
+        sys.exit(f"no such proof: {', '.join(sorted(unknown))}")
+    return [proof for proof in PROOFS if proof.name in names or not names]
+
+
+def run(proof: Proof, amount: int, seed: int) -> Outcome:
+    """One start of a proof. Counts that are missing, or that count nothing, make it fail."""
+    with tempfile.TemporaryDirectory() as scratch:
+        figures = Path(scratch) / "figures.json"
+        started = time.monotonic()
+        command = [*proof.command, "--amount", str(amount), "--seed", str(seed),
+                   "--figures", str(figures)]
+        ended = subprocess.run(command, cwd=TREE, stdin=subprocess.DEVNULL, text=True,
+                               errors="backslashreplace", stdout=subprocess.PIPE,
+                               stderr=subprocess.STDOUT)
+        seconds = time.monotonic() - started
+        output = f"$ {' '.join(command)}\n{ended.stdout}(exit status {ended.returncode})\n"
+        counts = read_counts(figures)
+    passed = (ended.returncode == 0 and counts.get("failures", 1) == 0
+              and counts.get(proof.unit, 0) > 0)
+    return Outcome(passed, counts, output, seconds)
+
+
+def read_counts(figures: Path) -> Counts:
+    try:
+        counts = json.loads(figures.read_text())
+    except (OSError, ValueError):
+        return {}
+    return counts if isinstance(counts, dict) else {}
+
+
+def described(counts: Counts) -> str:
+    return ", ".join(f"{value:,} {name}" for name, value in counts.items()).replace("_", " ")
+
+
+def build(proofs: list[Proof]) -> None:
+    """Brings the build directories of these proofs up to date; ends the program where it cannot."""
+    for name in sorted({proof.build for proof in proofs} | {"build"}):
+        ended = subprocess.run(["tools/build", name], cwd=TREE, stdout=subprocess.PIPE,
+                               stderr=subprocess.STDOUT, text=True)
+        if ended.returncode != 0:
+            print(ended.stdout[-4000:], file=sys.stderr)
+            sys.exit(f"{name} does not build")

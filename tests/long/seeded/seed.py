@@ -1,0 +1,71 @@
+"""tests/long/seeded/seed.py: applies one defect after the other and starts the proof of each.
+
+Started by tests/long/seeded/run, on the view of the tree that may be broken.
+"""
+import argparse
+import dataclasses
+import json
+import subprocess
+import sys
+from pathlib import Path
+
+HERE = Path(__file__).resolve().parent
+sys.path.insert(0, str(HERE.parent))
+
+import proofs
+from defects import DEFECTS, Defect, Start
+
+
+def apply(defect: Defect, *options: str) -> None:
+    subprocess.run(["git", "apply", *options, str(HERE / defect.patch)], cwd=proofs.TREE, check=True)
+
+
+def run(start: Start, seed: int) -> proofs.Outcome:
+    [proof] = proofs.named([start.proof])
+    proofs.build([proof])
+    started = dataclasses.replace(proof, command=(*proof.command, *start.words))
+    return proofs.run(started, start.amount, seed)
+
+
+def passes_undamaged(start: Start, seed: int) -> bool:
+    outcome = run(start, seed)
+    if not outcome.passed:
+        print(f"{start.proof} fails without any defect:\n{outcome.output[-4000:]}")
+    return outcome.passed
+
+
+def is_caught(defect: Defect, seed: int) -> bool:
+    """Whether the proof says that something is wrong: that it ran, and what failed."""
+    apply(defect)
+    try:
+        outcome = run(defect.noticed_by, seed)
+    finally:
+        apply(defect, "--reverse")
+    failures = outcome.counts.get("failures", 0)
+    if failures == 0:
+        print(f"{defect.patch} went unnoticed:\n{outcome.output[-4000:]}")
+    else:
+        print(f"{defect.patch}: {defect.noticed_by.proof} noticed, {failures:,} failures, "
+              f"{outcome.seconds:.0f} s", flush=True)
+    return failures > 0 and not outcome.passed
+
+
+def main() -> int:
+    parser = argparse.ArgumentParser(usage=__doc__)
+    parser.add_argument("--amount", type=int, required=True)
+    parser.add_argument("--seed", type=int, required=True)
+    parser.add_argument("--figures", type=Path, required=True)
+    options = parser.parse_args()
+
+    defects = DEFECTS[:options.amount]
+    # Before any defect, so that what was built once serves them all.
+    sound = {start: passes_undamaged(start, options.seed)
+             for start in dict.fromkeys(defect.noticed_by for defect in defects)}
+    verdicts = [sound[defect.noticed_by] and is_caught(defect, options.seed) for defect in defects]
+    options.figures.write_text(json.dumps(
+        {"defects": len(verdicts), "failures": verdicts.count(False)}) + "\n")
+    return 0 if verdicts and all(verdicts) else 1
+
+
+if __name__ == "__main__":
+    sys.exit(main())
