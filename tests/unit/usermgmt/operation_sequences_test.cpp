@@ -1,15 +1,8 @@
 // tests/unit/usermgmt/operation_sequences_test.cpp: after any operations in any order, memory and
 // files hold what they have to hold.
-#include <sys/stat.h>
-#include <unistd.h>
-
-#include <algorithm>
-#include <cerrno>
-
 #include <valgrind/valgrind.h>
 
-#include "tests/unit/usermgmt/account_model.h"
-#include "tests/unit/usermgmt/changed_accounts.h"
+#include "tests/unit/usermgmt/operation_runner.h"
 
 // Where each step costs ten to fifty times as much, a tenth has to do.
 #if defined(__SANITIZE_ADDRESS__)
@@ -24,256 +17,29 @@ static guint64 sequence_count() {
     return INSTRUMENTED || RUNNING_ON_VALGRIND ? SLOW_SEQUENCES : PLAIN_SEQUENCES;
 }
 
-// One file as it lies there.
-struct lying_file {
-    guint64 inode = 0;
-    unsigned mode = 0;
-    gint64 size = 0;
-    gint64 changed = 0;  // nanoseconds
-    std::string text;
-};
-
 class OperationSequences : public AccountFiles {
   protected:
-    void SetUp() override {
-        AccountFiles::SetUp();
-        sources_.stand_in = cheap_hash;
-        sources_.pid = 42;
-        sources_.ticks = 0;
-    }
     void TearDown() override {
-        ctx_.reset();
+        runner_.close();
         AccountFiles::TearDown();
     }
 
-    // Each returns what is wrong, "" when nothing is.
+    // What is wrong, "" when nothing is.
     std::string run_sequence(guint64 seed);
-    std::string run_operation(const operation &what);
-    std::string check_logs(const operation_result &result);
-    std::string reopen();
-    std::string check_files();
-    std::string check_lines(int row);
-    std::string check_root() const;
 
-    std::string start(const starting_files &files);
-    bool call(const operation &what, GError **error);
-    void count(const operation &what, const operation_result &result);
-
-    hashing_sources sources_;
-    open_context ctx_;
-    std::optional<account_model> model_;
-    guint32 open_flags_ = 0;
-    lying_file files_[CORE_FILE_COUNT];
-    std::vector<std::string> roots_hashes_;  // each that root may have in the file
-    std::size_t glib_warnings_ = 0;
-
-    // How often what was reached.
-    guint64 succeeded_[OPERATION_KINDS] = {};
-    guint64 refused_[OPERATION_KINDS] = {};
-    guint64 struck_[OPERATION_KINDS] = {};
+    operation_runner runner_;
 };
-
-// The text is only read of a file that is not the one that was there before.
-static lying_file look_at(int row, const lying_file &before) {
-    struct stat st = {};
-    if (stat(core_file_table[row].path, &st) != 0)
-        return {};
-    lying_file now = {st.st_ino, st.st_mode & 07777U, st.st_size,
-                      st.st_ctim.tv_sec * 1000000000 + st.st_ctim.tv_nsec, ""};
-    const bool same =
-        now.inode == before.inode && now.size == before.size && now.changed == before.changed;
-    now.text = same ? before.text : read_account_text(row);
-    return now;
-}
-
-std::string OperationSequences::start(const starting_files &files) {
-    ctx_.reset();
-    (void)unlink(core_file_table[CORE_FILE_ROW_SHADOW].path);
-    for (int row = 0; row < CORE_FILE_COUNT; row++) {
-        if (row != CORE_FILE_ROW_SHADOW || files.has_shadow)
-            create_account_file(row, files.texts[row], files.modes[row]);
-        files_[row] = look_at(row, {});
-    }
-    sources_.now = 20000 * 86400;
-    model_.emplace(read_account_files(), files.open_flags);
-    roots_hashes_ = {"$6$rootsalt$roothash"};
-    open_flags_ = files.open_flags;
-
-    error_slot error;
-    ctx_.reset(usermgmt_open(files.open_flags | USERMGMT_OPEN_TRYLOCK, error.out()));
-    (void)take_syslog();  // the lines that were skipped
-    return error.is_set() ? error.text() : model_->difference_from(ctx_.get());
-}
-
-static const char *or_null(const optional_text &text) {
-    return text ? text->c_str() : nullptr;
-}
-
-bool OperationSequences::call(const operation &what, GError **error) {
-    const char *account = or_null(what.account);
-    std::vector<const char *> names;
-    if (what.names)
-        for (const std::string &name : *what.names)
-            names.push_back(name.c_str());
-    entry_fields fields = {
-        what.type,    or_null(what.name),  or_null(what.password), or_null(what.group),
-        std::nullopt, or_null(what.gecos), or_null(what.shell),    what.uid};
-    if (what.names)
-        fields.groups = names;
-    const filled_entry entry(fields);
-    names.push_back(nullptr);
-
-    switch (what.kind) {
-        case operation_kind::add_user:
-            return usermgmt_add_user(ctx_.get(), account, entry.get(), error);
-        case operation_kind::modify_user: {
-            gboolean done = FALSE;
-            const lines warnings = glib_log_of(
-                [&] { done = usermgmt_modify_user(ctx_.get(), account, entry.get(), error); });
-            glib_warnings_ = warnings.size();
-            return done;
-        }
-        case operation_kind::delete_user:
-            return usermgmt_delete_user(ctx_.get(), account, error);
-        case operation_kind::disable_password:
-            return usermgmt_disable_password(ctx_.get(), account, error);
-        case operation_kind::add_group:
-            return usermgmt_add_group(ctx_.get(), account, names.data(), error);
-        case operation_kind::delete_group:
-            return usermgmt_delete_group(ctx_.get(), account, error);
-        case operation_kind::reopen:
-            break;
-    }
-    return false;
-}
-
-void OperationSequences::count(const operation &what, const operation_result &result) {
-    const auto kind = static_cast<std::size_t>(what.kind);
-    (result.succeeded ? succeeded_ : result.fault_struck ? struck_ : refused_)[kind]++;
-}
-
-// Files that another program changed are never seen here, and what was loaded before is only told
-// of when it is loaded again.
-std::string OperationSequences::check_logs(const operation_result &result) {
-    const bool mismatch = result.error.find("out of sync") != std::string::npos ||
-                          result.error.find(", primary group (") != std::string::npos;
-    for (const std::string &line : take_syslog())
-        if (!(model_->reloaded() || mismatch) ||
-            line.find("changed by another program") != std::string::npos)
-            return "logged " + line;
-    return "";
-}
-
-std::string OperationSequences::check_lines(int row) {
-    account_lines read;
-    read_account_lines(row, &read);
-    const account_lines &expected = model_->disk();
-    const bool same = row == CORE_FILE_ROW_PASSWD   ? read.passwd == expected.passwd
-                      : row == CORE_FILE_ROW_SHADOW ? read.shadow == expected.shadow
-                                                    : read.group == expected.group;
-    return same ? "" : std::string("other records in ") + core_file_table[row].name;
-}
-
-std::string OperationSequences::check_files() {
-    for (int row = 0; row < CORE_FILE_COUNT; row++) {
-        const std::string name = core_file_table[row].name;
-        lying_file now = look_at(row, files_[row]);
-        if ((now.inode != files_[row].inode) != model_->replaced(row))
-            return name + (model_->replaced(row) ? " was not replaced" : " was replaced");
-        if (now.mode != files_[row].mode)
-            return name + " has another mode";
-        if (now.text != model_->disk().texts[row])
-            return name + " holds\n" + now.text + "instead of\n" + model_->disk().texts[row];
-        if (access((core_file_table[row].path + std::string(".tmp")).c_str(), F_OK) == 0)
-            return name + " has left a temporary file";
-        files_[row] = std::move(now);
-        const std::string other_lines = model_->replaced(row) ? check_lines(row) : "";
-        if (!other_lines.empty())
-            return other_lines;
-    }
-    return check_root();
-}
-
-// Nobody else becomes root, and root changes only by a password of its own.
-std::string OperationSequences::check_root() const {
-    const account_lines &disk = model_->disk();
-    if (!files_[CORE_FILE_ROW_PASSWD].text.starts_with("root:x:0:0:root:/root:/bin/sh\n"))
-        return "root's passwd line changed";
-    for (const passwd_line &line : disk.passwd)
-        if ((line.uid == 0) != (&line == &disk.passwd[0]) ||
-            (line.name == "root") != (&line == &disk.passwd[0]))
-            return "a second root";
-    const bool has_known_hash =
-        !disk.has_shadow ||
-        std::any_of(roots_hashes_.begin(), roots_hashes_.end(), [this](const std::string &hash) {
-            const std::string &text = files_[CORE_FILE_ROW_SHADOW].text;
-            return text.starts_with("root:" + hash + ":");
-        });
-    return has_known_hash ? "" : "root's shadow line changed";
-}
-
-std::string OperationSequences::reopen() {
-    error_slot error;
-    ctx_.reset();
-    ctx_.reset(usermgmt_open(open_flags_ | USERMGMT_OPEN_TRYLOCK, error.out()));
-    return error.text();
-}
-
-std::string OperationSequences::run_operation(const operation &what) {
-    *sources_.now += what.seconds_later;
-    sources_.hashes.clear();
-    sources_.settings.clear();
-    sources_.reads.clear();
-    glib_warnings_ = 0;
-    const std::size_t expected_warnings =
-        what.kind == operation_kind::modify_user && what.account
-            ? (model_->users_dirty() ? 1U : 0U) + (model_->groups_dirty() ? 1U : 0U)
-            : 0U;
-
-    operation_result result = {};
-    result.now = *sources_.now;
-    if (what.kind == operation_kind::reopen) {
-        result.error = reopen();
-        result.succeeded = result.error.empty();
-        model_->reopen();
-    } else {
-        error_slot error;
-        std::optional<io_trace> trace;
-        if (what.fault) {
-            trace.emplace();
-            trace->fail(what.fault->call, what.fault->path, what.fault->nth, EIO);
-        }
-        result.succeeded = call(what, error.out());
-        result.fault_struck = trace && trace->has_struck();
-        result.error = error.text();
-        result.new_hash = sources_.hashes.empty() ? "" : sources_.hashes.back();
-        if (what.account == "root" && !result.new_hash.empty())
-            roots_hashes_.push_back(result.new_hash);
-        model_->follow(what, result);
-    }
-    count(what, result);
-
-    if (result.succeeded != result.error.empty() || (result.fault_struck && result.succeeded))
-        return "ended with " + std::to_string(result.succeeded) + " and the error " + result.error;
-    if (glib_warnings_ != expected_warnings)
-        return "warned " + std::to_string(glib_warnings_) + " times";
-    for (const std::string &fault : {model_->objection(), check_logs(result),
-                                     model_->difference_from(ctx_.get()), check_files()})
-        if (!fault.empty())
-            return fault + "\nThe error: " + result.error;
-    return "";
-}
 
 std::string OperationSequences::run_sequence(guint64 seed) {
     random_operations chance(seed);
     const starting_files files = chance.next_files();
-    sources_.random = std::string(10, static_cast<char>('A' + chance.below(26)));
+    const auto salt_letter = static_cast<char>('A' + chance.below(26));
     std::string done =
         "The seed " + std::to_string(seed) + ", open flags " + std::to_string(files.open_flags);
-    std::string fault = start(files);
+    std::string fault = runner_.start(files, salt_letter);
     for (unsigned left = 3 + chance.below(6); fault.empty() && left > 0; left--) {
         const operation what = chance.next_operation(files.has_shadow);
-        fault = run_operation(what);
+        fault = runner_.run(what);
         done += "\n" + described(what);
     }
     return fault.empty() ? "" : done + "\n" + fault;
@@ -291,11 +57,11 @@ TEST_F(OperationSequences, LeaveMemoryAndFilesAsTheyHaveToBe) {
     // Every kind ended in every way often enough to tell something.
     for (int kind = 0; kind < OPERATION_KINDS; kind++) {
         SCOPED_TRACE(kind);
-        EXPECT_GT(succeeded_[kind], sequences / 50);
+        EXPECT_GT(runner_.succeeded(kind), sequences / 50);
         if (kind == static_cast<int>(operation_kind::reopen))
             continue;
-        EXPECT_GT(refused_[kind], sequences / 50);
-        EXPECT_GT(struck_[kind], sequences / 200);
+        EXPECT_GT(runner_.refused(kind), sequences / 50);
+        EXPECT_GT(runner_.struck(kind), sequences / 200);
     }
     RecordProperty("sequences", std::to_string(sequences));
 }

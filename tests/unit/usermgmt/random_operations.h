@@ -2,9 +2,11 @@
 // same seed.
 #pragma once
 
+#include <functional>
 #include <optional>
 #include <random>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include <glib.h>
@@ -60,7 +62,9 @@ struct starting_files {
 
 class random_operations {
   public:
-    explicit random_operations(guint64 seed) : source_(seed) {}
+    explicit random_operations(guint64 seed) : source_(std::mt19937_64(seed)) {}
+    // Every choice is one number of the source.
+    explicit random_operations(std::function<guint64()> source) : source_(std::move(source)) {}
 
     starting_files next_files();
     operation next_operation(bool with_fault);
@@ -80,5 +84,5 @@ class random_operations {
     void fill_modification(operation *what);
     planned_fault fault(bool of_groups);
 
-    std::mt19937_64 source_;
+    std::function<guint64()> source_;
 };
