@@ -9,7 +9,7 @@ from .host_tool import run_tool
 
 STORAGE_RECIPE = Path(__file__)
 
-DISK_SIZE = 64 << 20
+DISK_SIZE = 512 << 20
 BOOT_BLOCK_START = 1 << 20
 BOOT_BLOCK_SIZE = 1 << 20
 PARTITIONS = f"""label: dos

@@ -1,0 +1,106 @@
+"""tests/long/power/cut_states.py: which states of the disk a power cut may leave, as the log has
+it, and a choice of them."""
+import random
+from collections.abc import Iterator, Sequence
+from dataclasses import dataclass
+
+from write_log import FUA, FLUSH, Entry
+
+METADATA = 16
+SECTOR, BLOCK = 512, 4096
+IN_VAIN = 30
+
+
+@dataclass(frozen=True)
+class State:
+    """All before `base` is on the disk, and of what follows the `extra` entries; of the entry
+    `torn` only that many bytes. Whatever was answered before `demand` must be there; nothing is
+    there that was begun after `newest`."""
+
+    base: int
+    demand: int
+    newest: int
+    extra: tuple[int, ...] = ()
+    torn: int = -1
+    bytes: int = 0
+
+
+def prefixes(entries: Sequence[Entry], start: int) -> list[State]:
+    """The disk after each write. What is in the log between it and the next has happened, too."""
+    writes = [number for number in range(start, len(entries)) if entries[number].length]
+    ends = [*writes[1:], len(entries)]
+    return [State(write + 1, end, write) for write, end in zip(writes, ends, strict=True)]
+
+
+def epochs(entries: Sequence[Entry], start: int) -> list[list[int]]:
+    """The writes that no flush, and no write past the cache, tells apart."""
+    found: list[list[int]] = []
+    writes: list[int] = []
+    for number in range(start, len(entries)):
+        if entries[number].length:
+            writes.append(number)
+        if writes and entries[number].flags & (FLUSH | FUA):
+            found.append(writes)
+            writes = []
+    return found + [writes] if writes else found
+
+
+def subsets(entries: Sequence[Entry], start: int, amount: int, seed: str) -> list[State]:
+    """Different ones, spread over the epochs; fewer than asked for where there are no more."""
+    chance = random.Random(seed)
+    drawn: dict[State, None] = {}
+    all_epochs = epochs(entries, start)
+    vain = dict.fromkeys(range(len(all_epochs)), 0)
+    while vain and len(drawn) < amount:
+        for number in list(vain):
+            state = _draw(entries, all_epochs[number], chance)
+            if state is None or state in drawn:
+                # A small epoch's states are soon all drawn.
+                vain[number] += 1
+                if vain[number] == IN_VAIN:
+                    del vain[number]
+                continue
+            drawn[state] = None
+            vain[number] = 0
+            if len(drawn) == amount:
+                break
+    return list(drawn)
+
+
+def _draw(entries: Sequence[Entry], epoch: list[int], chance: random.Random) -> State | None:
+    """None for a state that is a prefix, which is there anyway."""
+    share = chance.choice((0.5, 0.5, chance.random()))
+    extra = tuple(number for number in epoch if chance.random() < share)
+    if not extra:
+        return None
+    tearable = [number for number in extra if entries[number].length > _unit(entries[number])]
+    if tearable and chance.random() < 0.5:
+        torn = chance.choice(tearable)
+        unit = _unit(entries[torn])
+        length = unit * chance.randrange(1, entries[torn].length // unit)
+        return State(epoch[0], epoch[0], extra[-1], extra, torn, length)
+    if extra == tuple(epoch[:len(extra)]):
+        return None
+    return State(epoch[0], epoch[0], extra[-1], extra)
+
+
+def _unit(entry: Entry) -> int:
+    """A disk writes sectors, but what a file system keeps for itself it trusts to be written in
+    blocks."""
+    return BLOCK if entry.flags & METADATA else SECTOR
+
+
+def choose(entries: Sequence[Entry], start: int, amount: int, seed: str) -> list[State]:
+    """Every prefix, if they are not more than two thirds, and subsets for the rest; ordered by
+    where they begin."""
+    chosen = prefixes(entries, start)
+    most = max(1, amount * 2 // 3)
+    if len(chosen) > most:
+        chosen = random.Random(seed).sample(chosen, most)
+    chosen += subsets(entries, start, amount - len(chosen), seed)
+    return sorted(chosen, key=lambda state: state.base)
+
+
+def in_pieces(states: Sequence[State], size: int) -> Iterator[Sequence[State]]:
+    for start in range(0, len(states), size):
+        yield states[start:start + size]

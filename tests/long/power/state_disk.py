@@ -1,0 +1,144 @@
+"""tests/long/power/state_disk.py: a disk as a power cut left it, and what is found on it after the
+file system's own recovery."""
+import os
+import re
+import subprocess
+from pathlib import Path
+
+from boot_copies import COPY_SIZE, active_parameters
+from cut_states import State
+from recorded_run import BOOT_BLOCK_SIZE, DISK_SIZE, FILE_SYSTEM_SIZE, File, RecordedRun, Version
+
+PATHS = {
+    "passwd": "/etc/passwd", "shadow": "/etc/shadow", "group": "/etc/group",
+    "digest": "/etc/apache2/digest_auth_passwd", "parameters": "/etc/privane/parameters.conf"}
+# What e2fsck answers when nothing is left to do.
+CLEAN, CORRECTED = 0, 1
+TOOL_SECONDS = 60
+ENVIRONMENT = {**os.environ, "PATH": os.environ.get("PATH", os.defpath) + ":/usr/sbin:/sbin",
+               "LC_ALL": "C"}
+
+
+class BrokenFileSystem(Exception):
+    """It cannot be mounted any more."""
+
+
+class StateDisk:
+    """Makes states in files of a folder; it is quick when they come in the order of the log."""
+
+    def __init__(self, run: RecordedRun, folder: Path) -> None:
+        self._run = run
+        self._replayed = sparse_file(folder / "replayed", DISK_SIZE)
+        self._path = folder / "state"
+        self._state = sparse_file(self._path, FILE_SYSTEM_SIZE)
+        self._commands = folder / "commands"
+        self._commands.write_text("".join(f"stat {path}\ncat {path}\n" for path in PATHS.values()))
+        self._applied = 0
+
+    def left_by(self, state: State) -> Version:
+        """Raises BrokenFileSystem."""
+        boot = self._make(state)
+        self._recover()
+        version = self._read_files()
+        parameters = active_parameters(boot)
+        version["boot"] = None if parameters is None else (0, 0, 0, parameters)
+        return version
+
+    def _make(self, state: State) -> bytes:
+        """Returns the boot block's copies, which need no recovery."""
+        if state.base < self._applied:
+            os.ftruncate(self._replayed, 0)
+            os.ftruncate(self._replayed, DISK_SIZE)
+            self._applied = 0
+        for number in range(self._applied, state.base):
+            self._apply(self._replayed, number)
+        self._applied = state.base
+
+        copy_data(self._replayed, self._state)
+        boot = bytearray(os.pread(self._replayed, BOOT_BLOCK_SIZE, FILE_SYSTEM_SIZE))
+        for number in state.extra:
+            entry = self._run.entries[number]
+            data = self._run.data_of(entry)
+            if number == state.torn:
+                data = data[:state.bytes]
+            if entry.start < FILE_SYSTEM_SIZE:
+                os.pwrite(self._state, data, entry.start)
+            else:
+                start = entry.start - FILE_SYSTEM_SIZE
+                boot[start:start + len(data)] = data
+        return bytes(boot[:2 * COPY_SIZE])
+
+    def _apply(self, disk: int, number: int) -> None:
+        entry = self._run.entries[number]
+        if entry.length:
+            os.pwrite(disk, self._run.data_of(entry), entry.start)
+
+    def _recover(self) -> None:
+        """Replays the journal, as mounting would, and looks whether all is in order then."""
+        done = _tool("e2fsck", "-f", "-p", self._path)
+        if done.returncode not in (CLEAN, CORRECTED):
+            raise BrokenFileSystem(f"e2fsck: status {done.returncode}: "
+                                   f"{(done.stdout + done.stderr).decode(errors='replace')[-600:]}")
+
+    def _read_files(self) -> Version:
+        done = _tool("debugfs", "-f", self._commands, self._path)
+        if done.returncode != 0:
+            raise BrokenFileSystem(f"debugfs: {done.stderr.decode(errors='replace')[-600:]}")
+        return read_listing(done.stdout)
+
+
+def read_listing(listing: bytes) -> Version:
+    """What debugfs prints for the commands above: each command, and behind it its answer."""
+    pieces = re.split(rb"^debugfs: (?:stat|cat) \S+\n", listing, flags=re.MULTILINE)[1:]
+    if len(pieces) != 2 * len(PATHS):
+        raise BrokenFileSystem(f"debugfs answered {len(pieces)} of {2 * len(PATHS)} commands")
+    return {name: _file_of(pieces[2 * number], pieces[2 * number + 1])
+            for number, name in enumerate(PATHS)}
+
+
+def _file_of(status: bytes, content: bytes) -> File:
+    """Nothing is on standard output for a file that is not there."""
+    if not status.strip():
+        return None
+    found = re.search(rb"Type: (\w+) +Mode: +(\d+)", status)
+    owners = re.search(rb"User: +(\d+) +Group: +(\d+)", status)
+    if found is None or owners is None or found[1] != b"regular":
+        raise BrokenFileSystem(f"debugfs: {status[:200]!r}")
+    return int(found[2], 8), int(owners[1]), int(owners[2]), content
+
+
+def _tool(*words: str | Path) -> subprocess.CompletedProcess[bytes]:
+    return subprocess.run(words, stdin=subprocess.DEVNULL, capture_output=True, env=ENVIRONMENT,
+                          timeout=TOOL_SECONDS, check=False)
+
+
+def sparse_file(path: Path, size: int) -> int:
+    descriptor = os.open(path, os.O_RDWR | os.O_CREAT | os.O_TRUNC | os.O_CLOEXEC, 0o600)
+    os.ftruncate(descriptor, size)
+    return descriptor
+
+
+def _extents(disk: int) -> list[tuple[int, int]]:
+    found = []
+    end = 0
+    while True:
+        try:
+            start = os.lseek(disk, end, os.SEEK_DATA)
+        except OSError:  # no data behind the last
+            return found
+        end = os.lseek(disk, start, os.SEEK_HOLE)
+        found.append((start, end))
+
+
+def copy_data(source: int, target: int) -> None:
+    """Makes the target's content that of the source's beginning, wherever either has any."""
+    reached = 0
+    size = os.fstat(target).st_size
+    for start, end in sorted([*_extents(source), *_extents(target)]):
+        start, end = max(start, reached), min(end, size)
+        if start >= end:
+            continue
+        os.lseek(target, start, os.SEEK_SET)
+        while start < end:
+            start += os.sendfile(target, source, start, end - start)
+        reached = end

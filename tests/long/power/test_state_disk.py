@@ -1,0 +1,103 @@
+"""tests/long/power/test_state_disk.py: a disk is made of a log, and its files and boot block are
+read."""
+import json
+import os
+import struct
+import subprocess
+import zlib
+from pathlib import Path
+
+import pytest
+from boot_copies import COPY_SIZE, active_parameters
+from cut_states import State
+from made_logs import made_log, marked, written
+from recorded_run import ANSWERS, DISK_SIZE, FILE_SYSTEM_SIZE, LOG, STEPS, RecordedRun
+from state_disk import (ENVIRONMENT, PATHS, BrokenFileSystem, StateDisk, copy_data,
+                        sparse_file)
+from write_log import FLUSH
+
+CONTENT = {"passwd": b"root:x:0:0:\n", "shadow": b"debugfs: no command\n", "group": b""}
+
+
+def boot_copy(number: int, text: bytes) -> bytes:
+    padded = text.ljust(COPY_SIZE - 5, b"\0")
+    return struct.pack("<IB", zlib.crc32(padded), number) + padded
+
+
+@pytest.fixture(scope="module")
+def disk_image(tmp_path_factory: pytest.TempPathFactory) -> bytes:
+    folder = tmp_path_factory.mktemp("image")
+    for name, content in CONTENT.items():
+        path = folder / "root" / PATHS[name][1:]
+        path.parent.mkdir(parents=True, exist_ok=True)
+        path.write_bytes(content)
+        path.chmod(0o640 if name == "shadow" else 0o644)
+    image = folder / "disk"
+    subprocess.run(["mkfs.ext4", "-q", "-b", "4096", "-d", folder / "root", image,
+                    f"{FILE_SYSTEM_SIZE >> 10}k"], env=ENVIRONMENT, check=True)
+    return image.read_bytes().ljust(DISK_SIZE, b"\0")
+
+
+@pytest.fixture
+def disk(disk_image: bytes, tmp_path: Path) -> StateDisk:
+    new = boot_copy(2, b"B=" + b"2" * 1000 + b"\0")
+    log = made_log(written(0, disk_image), written(FILE_SYSTEM_SIZE, boot_copy(1, b"A=1\0")),
+                   marked("start-0"), written(FILE_SYSTEM_SIZE + COPY_SIZE, new),
+                   written(0, b"\0" * 8192), written(0, b"", FLUSH))
+    (tmp_path / LOG).write_bytes(log)
+    (tmp_path / STEPS).write_text(json.dumps([]))
+    (tmp_path / ANSWERS).write_text("")
+    return StateDisk(RecordedRun(tmp_path), tmp_path)
+
+
+def state(base: int, *extra: int, torn: int = -1) -> State:
+    return State(base, base, base, extra, torn, 512)
+
+
+def test_the_files_of_a_state(disk: StateDisk) -> None:
+    left = disk.left_by(state(3))
+    owner = left["passwd"][1:3] if left["passwd"] else ()
+    assert left == {"passwd": (0o644, *owner, CONTENT["passwd"]),
+                    "shadow": (0o640, *owner, CONTENT["shadow"]),
+                    "group": (0o644, *owner, b""), "digest": None, "parameters": None,
+                    "boot": (0, 0, 0, b"A=1")}
+
+
+def test_extra_writes_are_of_this_state_only(disk: StateDisk) -> None:
+    assert disk.left_by(state(3, 3))["boot"] == (0, 0, 0, b"B=" + b"2" * 1000)
+    assert disk.left_by(state(3))["boot"] == (0, 0, 0, b"A=1")
+    assert disk.left_by(state(3, 3, torn=3))["boot"] == (0, 0, 0, b"A=1")
+    with pytest.raises(BrokenFileSystem):
+        disk.left_by(state(3, 4))
+    assert disk.left_by(state(4))["boot"] == (0, 0, 0, b"B=" + b"2" * 1000)
+    # Back to an earlier state: the disk is made anew.
+    assert disk.left_by(state(3))["boot"] == (0, 0, 0, b"A=1")
+
+
+def test_nothing_stays_of_the_state_before(tmp_path: Path) -> None:
+    source = sparse_file(tmp_path / "source", 1 << 20)
+    target = sparse_file(tmp_path / "target", 1 << 19)
+    os.pwrite(source, b"kept", 8192)
+    os.pwrite(source, b"behind the end", 1 << 19)
+    for position in (0, 8192, 65536, (1 << 19) - 4096):
+        os.pwrite(target, b"recovered" * 400, position)
+    copy_data(source, target)
+    assert os.pread(target, 1 << 20, 0) == os.pread(source, 1 << 19, 0)
+    assert os.pread(target, 4, 8192) == b"kept"
+
+
+def test_a_file_system_that_is_lost(disk: StateDisk) -> None:
+    with pytest.raises(BrokenFileSystem):
+        disk.left_by(state(5))
+
+
+def test_the_boot_copy_that_counts() -> None:
+    one, two = boot_copy(1, b"A=1\0"), boot_copy(2, b"A=2\0B=\0")
+    assert active_parameters(one + two) == active_parameters(two + one) == b"A=2\0B="
+    assert active_parameters(one + two[:-1] + b"x") == b"A=1"
+    assert active_parameters(b"\xff" * COPY_SIZE + one) == b"A=1"
+    assert active_parameters(boot_copy(255, b"A=1\0") + boot_copy(0, b"A=2\0")) == b"A=2"
+    assert active_parameters(boot_copy(0, b"A=2\0") + boot_copy(255, b"A=1\0")) == b"A=2"
+    assert active_parameters(b"\0" * 2 * COPY_SIZE) is None
+    long = boot_copy(1, b"A=" + b"1" * 1000 + b"\0")
+    assert active_parameters(long[:512] + b"\0" * (2 * COPY_SIZE - 512)) is None
