@@ -54,7 +54,7 @@ PROOFS: tuple[Proof, ...] = (
     Proof("daemon_kills", on_bus("daemon_kills"), "points",
           gate=300, step=1_000, aim=12_500, full=25_000),
     Proof("power_cuts", ("tests/long/power/power_cuts",), "states",
-          gate=3_000, step=10_000, aim=50_000, full=250_000, cores=2),
+          gate=3_000, step=12_000, aim=50_000, full=250_000, cores=2),
     Proof("fuzzing", ("tests/fuzz/run",), "seconds",
           gate=10, step=60, aim=480, full=2_400, build="build-fuzz", cores=2),
     Proof("bus_fuzzing", on_bus("bus_fuzzing", "build-sanitize"), "calls",
