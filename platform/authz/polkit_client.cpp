@@ -1,47 +1,38 @@
 // platform/authz/polkit_client.cpp: asks polkit on the process's connection, and words its answers.
 //
-// Libpolkit's synchronous check waits for ever when polkit hangs. So the asynchronous one runs on a
-// main context of the client's own, where a timer can cancel it and no source of the program's own
-// loop is dispatched meanwhile.
+// Polkit is asked without its library: that one waits for ever where polkit hangs, and reads an
+// answer of another form as if it were one.
 #include "platform/authz/polkit_client.h"
 
 #include <cstring>
 
 #include <gio/gio.h>
-#include <polkit/polkit.h>
 
 #include "platform/authz/authz_error.h"
 #include "platform/authz/unit_action.h"
 
 static constexpr const char *AUTHORITY_PATH = "/org/freedesktop/PolicyKit1/Authority";
 static constexpr const char *AUTHORITY_INTERFACE = "org.freedesktop.PolicyKit1.Authority";
+static constexpr const char *POLKIT_ERRORS = "org.freedesktop.PolicyKit1.Error.";
+
+// Whether it is authorized, whether it could be after a password was given, and details.
+static constexpr const char *ANSWER_TYPE = "((bba{ss}))";
+
+static constexpr guint32 NO_INTERACTION = 0;
 
 // For what the bus itself is asked besides, which it knows at once.
 static constexpr int BUS_DEADLINE_MS = 2000;
 
-static constexpr gulong OWNER_POLL_US = 5000;
-
 enum class polkit_answer { ALLOWED, REFUSED, NEEDS_PASSWORD };
 
-struct polkit_client {
-    GDBusConnection *bus;
-    GMainContext *context;
-    PolkitAuthority *authority;
-    bool has_cancelled;
-};
-
-static polkit_client client;
+static GDBusConnection *client_bus;
 
 struct question {
     const char *sender;
     const char *action_id;
-    PolkitDetails *details;
+    const char *unit;         // null, or what the details tell of a unit
+    const char *unit_action;  // and its own action
     gint64 deadline;
-};
-
-struct pending_check {
-    GCancellable *cancellable;
-    GAsyncResult *result;
 };
 
 static int remaining_ms(gint64 deadline) {
@@ -52,78 +43,56 @@ static int remaining_ms(gint64 deadline) {
 // The bus connection is the program's shared one: with one of its own, the checks would still go
 // through while the program's is down.
 static bool open_bus(GError **error) {
-    if (client.bus == nullptr)
-        client.bus = g_bus_get_sync(G_BUS_TYPE_SYSTEM, nullptr, error);
-    return client.bus != nullptr;
+    if (client_bus == nullptr)
+        client_bus = g_bus_get_sync(G_BUS_TYPE_SYSTEM, nullptr, error);
+    return client_bus != nullptr;
 }
 
-// Asks the bus itself about a name; null where it has no answer.
-static GVariant *call_bus(const char *method, const char *name, const char *reply_type) {
-    return g_dbus_connection_call_sync(client.bus, "org.freedesktop.DBus", "/org/freedesktop/DBus",
-                                       "org.freedesktop.DBus", method, g_variant_new("(s)", name),
-                                       G_VARIANT_TYPE(reply_type), G_DBUS_CALL_FLAGS_NONE,
-                                       BUS_DEADLINE_MS, nullptr, nullptr);
+static GVariant *arguments_of(const question &asked, const char *cancellation_id) {
+    GVariantBuilder identity;
+    GVariantBuilder details;
+
+    g_variant_builder_init(&identity, G_VARIANT_TYPE("a{sv}"));
+    g_variant_builder_add(&identity, "{sv}", "name", g_variant_new_string(asked.sender));
+    g_variant_builder_init(&details, G_VARIANT_TYPE("a{ss}"));
+    if (asked.unit != nullptr) {
+        g_variant_builder_add(&details, "{ss}", "action", asked.unit_action);
+        g_variant_builder_add(&details, "{ss}", "unit", asked.unit);
+    }
+    return g_variant_new("((sa{sv})sa{ss}us)", "system-bus-name", &identity, asked.action_id,
+                         &details, NO_INTERACTION, cancellation_id);
 }
 
-// Libpolkit sets itself up without a deadline. A first call that has one starts polkit where it
-// is not running, and proves that it answers.
-static bool wake_polkit(gint64 deadline, GError **error) {
-    g_autoptr(GVariant) properties = g_dbus_connection_call_sync(
-        client.bus, POLKIT_NAME, AUTHORITY_PATH, "org.freedesktop.DBus.Properties", "GetAll",
-        g_variant_new("(s)", AUTHORITY_INTERFACE), nullptr, G_DBUS_CALL_FLAGS_NONE,
-        remaining_ms(deadline), nullptr, error);
-    return properties != nullptr;
+// Nobody waits for the answer any more.
+static void cancel_question(const char *cancellation_id) {
+    g_dbus_connection_call(client_bus, POLKIT_NAME, AUTHORITY_PATH, AUTHORITY_INTERFACE,
+                           "CancelCheckAuthorization", g_variant_new("(s)", cancellation_id),
+                           nullptr, G_DBUS_CALL_FLAGS_NO_AUTO_START, -1, nullptr, nullptr, nullptr);
 }
 
-static bool open_authority(gint64 deadline, GError **error) {
-    if (client.authority == nullptr && wake_polkit(deadline, error))
-        client.authority = polkit_authority_get_sync(nullptr, error);
-    return client.authority != nullptr;
-}
-
-static void on_answer(GObject *, GAsyncResult *result, void *pending) {
-    static_cast<pending_check *>(pending)->result = G_ASYNC_RESULT(g_object_ref(result));
-}
-
-static gboolean on_deadline(void *pending) {
-    g_cancellable_cancel(static_cast<pending_check *>(pending)->cancellable);
-    return G_SOURCE_REMOVE;
-}
-
-static polkit_answer answer_of(PolkitAuthorizationResult *result) {
-    if (polkit_authorization_result_get_is_authorized(result))
-        return polkit_answer::ALLOWED;
-    return polkit_authorization_result_get_is_challenge(result) ? polkit_answer::NEEDS_PASSWORD
-                                                                : polkit_answer::REFUSED;
-}
-
+// A sound answer is one of the right form; GDBus makes any other an error.
 static bool ask_once(const question &asked, polkit_answer *out_answer, GError **error) {
-    if (!open_authority(asked.deadline, error))
-        return false;
+    static guint questions = 0;
+    g_autofree char *cancellation_id = g_strdup_printf("question-%u", ++questions);
+    g_autoptr(GError) cause = nullptr;
+    g_autoptr(GVariant) answer = g_dbus_connection_call_sync(
+        client_bus, POLKIT_NAME, AUTHORITY_PATH, AUTHORITY_INTERFACE, "CheckAuthorization",
+        arguments_of(asked, cancellation_id), G_VARIANT_TYPE(ANSWER_TYPE), G_DBUS_CALL_FLAGS_NONE,
+        remaining_ms(asked.deadline), nullptr, &cause);
+    gboolean is_authorized = FALSE;
+    gboolean needs_password = FALSE;
 
-    g_autoptr(PolkitSubject) subject = polkit_system_bus_name_new(asked.sender);
-    g_autoptr(GCancellable) cancellable = g_cancellable_new();
-    pending_check pending = {cancellable, nullptr};
-    g_autoptr(GSource) timer =
-        g_timeout_source_new(static_cast<guint>(remaining_ms(asked.deadline)));
-    g_source_set_callback(timer, on_deadline, &pending, nullptr);
-    (void)g_source_attach(timer, client.context);  // Its number is not needed to destroy it.
-
-    polkit_authority_check_authorization(client.authority, subject, asked.action_id, asked.details,
-                                         POLKIT_CHECK_AUTHORIZATION_FLAGS_NONE, cancellable,
-                                         on_answer, &pending);
-    while (pending.result == nullptr)
-        (void)g_main_context_iteration(client.context, TRUE);  // Whatever ran, the result decides.
-    g_source_destroy(timer);
-
-    g_autoptr(GAsyncResult) finished = pending.result;
-    g_autoptr(PolkitAuthorizationResult) result =
-        polkit_authority_check_authorization_finish(client.authority, finished, error);
-    if (result == nullptr) {
-        client.has_cancelled |= g_cancellable_is_cancelled(cancellable) != FALSE;
+    if (answer == nullptr) {
+        if (g_error_matches(cause, G_IO_ERROR, G_IO_ERROR_TIMED_OUT))
+            cancel_question(cancellation_id);
+        g_propagate_error(error, g_steal_pointer(&cause));
         return false;
     }
-    *out_answer = answer_of(result);
+    g_variant_get(answer, "((bb@a{ss}))", &is_authorized, &needs_password, nullptr);
+    if (is_authorized)
+        *out_answer = polkit_answer::ALLOWED;
+    else
+        *out_answer = needs_password ? polkit_answer::NEEDS_PASSWORD : polkit_answer::REFUSED;
     return true;
 }
 
@@ -131,36 +100,7 @@ static bool ask_once(const question &asked, polkit_answer *out_answer, GError **
 // name and not yet gone, the bus does not let anybody call.
 static bool is_stale_owner(const GError *error) {
     return g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_NO_REPLY) ||
-           g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_ACCESS_DENIED) ||
-           g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_NAME_HAS_NO_OWNER) ||
-           g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_SERVICE_UNKNOWN);
-}
-
-// Null where nobody owns polkit's name.
-static char *find_owner() {
-    g_autoptr(GVariant) reply = call_bus("GetNameOwner", POLKIT_NAME, "(s)");
-    char *owner = nullptr;
-
-    if (reply != nullptr)
-        g_variant_get(reply, "(s)", &owner);
-    return owner;
-}
-
-// Libpolkit learns of a change from a signal, which waits on the context.
-static bool is_owner_known() {
-    while (g_main_context_iteration(client.context, FALSE)) {
-    }
-
-    g_autofree char *actual = find_owner();
-    g_autofree char *known = polkit_authority_get_owner(client.authority);
-    return g_strcmp0(actual, known) == 0;
-}
-
-// Libpolkit takes a new owner up only after a call to it, whose end nothing announces; until then
-// its questions go to the old one.
-static void await_owner(gint64 deadline) {
-    while (!is_owner_known() && remaining_ms(deadline) > 0)
-        g_usleep(OWNER_POLL_US);
+           g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_ACCESS_DENIED);
 }
 
 static bool ask(const question &asked, polkit_answer *out_answer, GError **error) {
@@ -168,20 +108,25 @@ static bool ask(const question &asked, polkit_answer *out_answer, GError **error
 
     if (ask_once(asked, out_answer, &first_error))
         return true;
-    if (client.authority == nullptr || !is_stale_owner(first_error)) {
+    if (!is_stale_owner(first_error)) {
         g_propagate_error(error, g_steal_pointer(&first_error));
         return false;
     }
-    await_owner(asked.deadline);
     return ask_once(asked, out_answer, error);
 }
 
+static bool is_of_polkit(const GError *error) {
+    g_autofree char *name = g_dbus_error_get_remote_error(error);
+    return name != nullptr && g_str_has_prefix(name, POLKIT_ERRORS);
+}
+
 // Polkit tells an action that no .policy file declares by its text alone.
-static bool is_undeclared(GError *error, const char *action_id) {
-    (void)g_dbus_error_strip_remote_error(error);  // A local error has nothing to strip.
+static bool is_undeclared(const GError *error, const char *action_id) {
+    g_autoptr(GError) told = g_error_copy(error);
     g_autofree char *text = g_strdup_printf("Action %s is not registered", action_id);
-    return g_error_matches(error, POLKIT_ERROR, POLKIT_ERROR_FAILED) &&
-           std::strcmp(error->message, text) == 0;
+
+    (void)g_dbus_error_strip_remote_error(told);  // A local error has nothing to strip.
+    return is_of_polkit(error) && std::strcmp(told->message, text) == 0;
 }
 
 // A unit's own action counts where it is declared. Where it is not, its parent decides, by rules
@@ -196,27 +141,15 @@ static bool ask_of_unit(const question &asked, polkit_answer *out_answer, GError
         g_propagate_error(error, g_steal_pointer(&cause));
         return false;
     }
-
-    g_autoptr(PolkitDetails) details = polkit_details_new();
-    polkit_details_insert(details, "action", asked.action_id);
-    polkit_details_insert(details, "unit", action.unit);
-    return ask({asked.sender, action.parent, details, asked.deadline}, out_answer, error);
-}
-
-static bool ask_on_own_context(const question &asked, polkit_answer *out_answer, GError **error) {
-    if (!open_bus(error))
-        return false;
-    if (client.context == nullptr)
-        client.context = g_main_context_new();
-
-    g_main_context_push_thread_default(client.context);
-    const bool answered = ask_of_unit(asked, out_answer, error);
-    g_main_context_pop_thread_default(client.context);
-    return answered;
+    return ask({asked.sender, action.parent, action.unit, asked.action_id, asked.deadline},
+               out_answer, error);
 }
 
 static bool find_uid(const char *sender, guint32 *out_uid) {
-    g_autoptr(GVariant) reply = call_bus("GetConnectionUnixUser", sender, "(u)");
+    g_autoptr(GVariant) reply = g_dbus_connection_call_sync(
+        client_bus, "org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus",
+        "GetConnectionUnixUser", g_variant_new("(s)", sender), G_VARIANT_TYPE("(u)"),
+        G_DBUS_CALL_FLAGS_NONE, BUS_DEADLINE_MS, nullptr, nullptr);
 
     if (reply == nullptr)
         return false;
@@ -239,17 +172,26 @@ static void set_refusal(const char *sender, const char *action_id, polkit_answer
                     reason);
 }
 
-// The errors of libpolkit and GDBus have domains that GDBus would map to its own names.
+// The errors of polkit and GDBus have domains that GDBus would map to its own names.
 static void set_failure(const char *action_id, gint64 deadline, GError *cause, GError **error) {
     int code = AUTHZ_ERROR_UNREACHABLE;
+    const char *reason = nullptr;
 
-    (void)g_dbus_error_strip_remote_error(cause);  // A local error has nothing to strip.
-    if (cause->domain == POLKIT_ERROR)
+    if (is_of_polkit(cause)) {
         code = AUTHZ_ERROR_FAILED;
-    else if (remaining_ms(deadline) == 0)
+    } else if (g_error_matches(cause, G_IO_ERROR, G_IO_ERROR_INVALID_ARGUMENT)) {
+        code = AUTHZ_ERROR_FAILED;
+        reason = "the answer has no valid form";
+    } else if (g_error_matches(cause, G_IO_ERROR, G_IO_ERROR_TIMED_OUT) ||
+               remaining_ms(deadline) == 0) {
         code = AUTHZ_ERROR_TIMED_OUT;
+        reason = "no answer in time";
+    }
+    // What the bus told polkit comes with the name of that error too.
+    while (g_dbus_error_strip_remote_error(cause)) {
+    }
     g_set_error(error, AUTHZ_ERROR_DOMAIN, code, "cannot check action %s: %s", action_id,
-                code == AUTHZ_ERROR_TIMED_OUT ? "no answer in time" : cause->message);
+                reason != nullptr ? reason : cause->message);
 }
 
 bool polkit_client_check(const char *sender, const char *action_id, int deadline_ms,
@@ -258,7 +200,8 @@ bool polkit_client_check(const char *sender, const char *action_id, int deadline
     polkit_answer answer = polkit_answer::REFUSED;
     g_autoptr(GError) cause = nullptr;
 
-    if (!ask_on_own_context({sender, action_id, nullptr, deadline}, &answer, &cause)) {
+    if (!open_bus(&cause) ||
+        !ask_of_unit({sender, action_id, nullptr, nullptr, deadline}, &answer, &cause)) {
         set_failure(action_id, deadline, cause, error);
         return false;
     }
@@ -267,22 +210,6 @@ bool polkit_client_check(const char *sender, const char *action_id, int deadline
     return answer == polkit_answer::ALLOWED;
 }
 
-// Libpolkit leaves its signal handlers connected to a bus proxy that a call under way keeps alive,
-// and they would use an authority that is gone. Calls of its own it makes after a cancelled
-// question and while it takes up a new owner.
-static bool is_authority_idle() {
-    return !client.has_cancelled && is_owner_known();
-}
-
 void polkit_client_release() {
-    if (client.authority != nullptr) {
-        const bool idle = is_authority_idle();
-        g_clear_object(&client.authority);
-        while (idle && g_main_context_iteration(client.context, FALSE)) {
-            // The subscriptions that ended with it free their data.
-        }
-    }
-    g_clear_pointer(&client.context, g_main_context_unref);
-    g_clear_object(&client.bus);
-    client.has_cancelled = false;
+    g_clear_object(&client_bus);
 }

@@ -4,7 +4,7 @@ from typing import Callable, Iterator
 
 import pytest
 
-from conftest import StartService
+from harness.service_fixtures import StartService
 from harness.accounts import HASH, AccountFiles
 from harness.bus import Bus
 from harness.fake_authz import FakeAuthz

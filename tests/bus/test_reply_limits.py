@@ -3,7 +3,7 @@ from typing import Callable, Iterator
 
 import pytest
 
-from conftest import StartService
+from harness.service_fixtures import StartService
 from harness.accounts import AccountFiles
 from harness.bus import Bus, domain_error, error_of
 from harness.fake_authz import FakeAuthz

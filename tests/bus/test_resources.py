@@ -3,7 +3,7 @@ import signal
 
 import pytest
 
-from conftest import StartService
+from harness.service_fixtures import StartService
 from harness.bus import Bus, BusError
 from harness.fake_authz import FakeAuthz
 

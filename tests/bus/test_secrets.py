@@ -4,7 +4,7 @@ That no log and no error text carries one is checked at the end of every test th
 """
 from pathlib import Path
 
-from conftest import StartService
+from harness.service_fixtures import StartService
 from harness.accounts import AccountFiles
 from harness.bus import Bus, error_of
 from harness.fake_authz import FakeAuthz

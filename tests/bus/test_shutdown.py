@@ -6,7 +6,7 @@ from typing import Iterator
 
 import pytest
 
-from conftest import StartService
+from harness.service_fixtures import StartService
 from harness.bus import Bus
 from harness.deadline import wait_for
 from harness.fake_authz import FakeAuthz

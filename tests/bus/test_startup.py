@@ -5,7 +5,7 @@ from pathlib import Path
 
 import pytest
 
-from conftest import StartService
+from harness.service_fixtures import StartService
 from harness import process
 from harness.bus import Bus
 from harness.deadline import wait_for

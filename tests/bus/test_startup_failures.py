@@ -4,7 +4,7 @@ from pathlib import Path
 
 import pytest
 
-from conftest import StartService
+from harness.service_fixtures import StartService
 from harness.accounts import (GROUP, PASSWD, SHADOW, STANDARD_PASSWD, STANDARD_SHADOW,
                               AccountFiles)
 from harness.bus import Bus

@@ -35,10 +35,11 @@ class Service:
 
     def __init__(self, arguments: Sequence[str] = ("-n",),
                  environment: Mapping[str, str] | None = None, wrapper: Sequence[str] = (),
-                 ignored: Sequence[signal.Signals] = ()) -> None:
+                 ignored: Sequence[signal.Signals] = (),
+                 stop_seconds: float | None = None) -> None:
         require_sandbox()
         self.in_foreground = list(arguments) == ["-n"]
-        self._stop_seconds = TRACED_STOP_SECONDS if wrapper else STOP_SECONDS
+        self._stop_seconds = stop_seconds or (TRACED_STOP_SECONDS if wrapper else STOP_SECONDS)
         self.status: int | None = None
         self._pid: int | None = None
         self._others = process.children()

@@ -83,6 +83,11 @@ class Stage:
         self.wire = Wire()
 
     @property
+    def environment(self) -> dict[str, str]:
+        """That of a service that uses the fakes."""
+        return dict(self._environment)
+
+    @property
     def service(self) -> Service:
         """The run that serves now."""
         return self._runs[-1]

@@ -82,6 +82,18 @@ TEST_F(AuthzCheck, ErrorOfPolkitComesWithoutItsBusName) {
               "Action test.undeclared is not registered");
 }
 
+// Criticals are fatal here: nothing may be read out of such an answer.
+TEST_F(AuthzCheck, AnswerOfAnotherFormIsAnError) {
+    const fake_polkit polkit;
+    ASSERT_TRUE(polkit.ready());
+
+    for (int form = 0; form < 8; form++) {
+        const std::string action = "test.form." + std::to_string(form);
+        EXPECT_EQ(verdict(action.c_str()),
+                  "0 authz 2 cannot check action " + action + ": the answer has no valid form");
+    }
+}
+
 TEST_F(AuthzCheck, AsksForTheBusNameWithoutDetailsAndInteraction) {
     const fake_polkit polkit;
     ASSERT_TRUE(polkit.ready());
@@ -273,7 +285,6 @@ static bool has_owner(const char *name) {
     return owned != FALSE;
 }
 
-// Libpolkit then has a call under way, and a signal handler for which the loss of the name waits.
 TEST_F(AuthzCheck, CancelledQuestionIsNoDangerToTheRelease) {
     const fake_polkit polkit;
     ASSERT_TRUE(polkit.ready());

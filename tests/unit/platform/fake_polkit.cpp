@@ -29,6 +29,7 @@ static constexpr const char *INTERFACE_XML =
     "</interface></node>";
 
 static const std::string UNIT_PREFIX = "com.zintor.privane-system.";
+static const std::string FORM_PREFIX = "test.form.";
 
 struct service {
     int ready_fd;
@@ -114,6 +115,30 @@ static void on_unit_question(const std::string &action, GVariant *question,
         answer_undeclared(call, action);
 }
 
+// An answer that says yes in another form than polkit's: its type, and a body of that type.
+static void answer_in_form(GDBusConnection *bus, GDBusMethodInvocation *call,
+                           const std::string &body) {
+    g_autoptr(GDBusMessage) reply =
+        g_dbus_message_new_method_reply(g_dbus_method_invocation_get_message(call));
+
+    g_dbus_message_set_body(reply, g_variant_new_parsed(body.c_str()));
+    (void)g_dbus_connection_send_message(bus, reply, G_DBUS_SEND_MESSAGE_FLAGS_NONE, nullptr,
+                                         nullptr);
+    g_object_unref(call);
+}
+
+// The bodies of "test.form.0" and those that follow.
+static constexpr const char *FORMS[] = {
+    "()",
+    "(true,)",
+    "(1,)",
+    "('yes',)",
+    "(true, true, @a{ss} {})",
+    "((true, true),)",
+    "((true, true, @a{sv} {}),)",
+    "((true, true, @a{ss} {}), 'more')",
+};
+
 static void on_question(GDBusConnection *bus, service *self, GVariant *question,
                         GDBusMethodInvocation *call) {
     const char *action = nullptr;
@@ -132,6 +157,8 @@ static void on_question(GDBusConnection *bus, service *self, GVariant *question,
         answer_undeclared(call, name);
     else if (name == "test.question")
         answer_with_error(call, describe(question));
+    else if (name.rfind(FORM_PREFIX, 0) == 0)
+        answer_in_form(bus, call, FORMS[std::stoul(name.substr(FORM_PREFIX.size()))]);
     else if (name == "test.cancelled")
         answer(call, self->was_cancelled, false);
     else if (name == "test.last-answer")

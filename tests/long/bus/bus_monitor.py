@@ -1,0 +1,73 @@
+"""tests/long/bus/bus_monitor.py: every message of the private bus, as the bus hands them on."""
+import contextlib
+import socket
+import threading
+from dataclasses import dataclass
+from typing import Callable
+
+from gi.repository import Gio, GLib
+
+from harness.deadline import wait_for
+from harness.wire import Wire
+
+BUS = "org.freedesktop.DBus"
+CALL, ERROR, SIGNAL = (Gio.DBusMessageType.METHOD_CALL, Gio.DBusMessageType.ERROR,
+                       Gio.DBusMessageType.SIGNAL)
+
+
+@dataclass(frozen=True)
+class Seen:
+    """Who said what to whom; the arguments as GIO unpacks them."""
+
+    type: Gio.DBusMessageType
+    sender: str | None
+    destination: str | None
+    interface: str | None
+    member: str | None
+    arguments: tuple[object, ...]
+    error_name: str | None
+
+
+class Monitor(Wire):
+    """A connection of root that only listens."""
+
+    def __init__(self) -> None:
+        super().__init__()
+        self._seen: list[Seen] = []
+        self._ask_bus_to_monitor()
+        self._socket.settimeout(None)
+        self._thread = threading.Thread(target=self._listen, daemon=True)
+        self._thread.start()
+
+    def _ask_bus_to_monitor(self) -> None:
+        serial = self._send(BUS, "/org/freedesktop/DBus", f"{BUS}.Monitoring", "BecomeMonitor",
+                            GLib.Variant("(asu)", ([], 0)))
+        while (message := self._receive()).get_reply_serial() != serial:
+            pass
+        assert message.get_message_type() == Gio.DBusMessageType.METHOD_RETURN
+
+    def _listen(self) -> None:
+        with contextlib.suppress(OSError, AssertionError):  # our end, or that of the bus
+            while True:
+                message = self._receive()
+                body = message.get_body()
+                self._seen.append(Seen(
+                    message.get_message_type(), message.get_sender(), message.get_destination(),
+                    message.get_interface(), message.get_member(),
+                    body.unpack() if body else (), message.get_error_name()))
+
+    def mark(self) -> int:
+        """The place in the record from which on a later message stands."""
+        return len(self._seen)
+
+    def since(self, mark: int) -> list[Seen]:
+        return self._seen[mark:]
+
+    def wait_for(self, what: str, mark: int, is_it: Callable[[Seen], bool]) -> Seen:
+        """The first such message since the mark."""
+        return wait_for(what, lambda: next(filter(is_it, self._seen[mark:]), None), 10)
+
+    def close(self) -> None:
+        self._socket.shutdown(socket.SHUT_RDWR)
+        self._thread.join(timeout=5)
+        self._socket.close()

@@ -1,0 +1,77 @@
+"""tests/long/bus/effects_trace.py: those system calls of the service by which work shows."""
+import os
+import re
+import signal
+from pathlib import Path
+
+from harness.deadline import wait_for
+from harness.strace import Attached
+
+FILES = ("?open", "openat", "?openat2", "?creat", "?unlink", "unlinkat", "?rename", "?renameat",
+         "renameat2", "?link", "linkat", "?symlink", "symlinkat", "?mkdir", "mkdirat", "?rmdir",
+         "?mknod", "mknodat", "?chmod", "fchmod", "fchmodat", "?chown", "fchown", "?lchown",
+         "fchownat", "truncate", "ftruncate", "fallocate", "?utime", "?utimes", "utimensat",
+         "setxattr", "lsetxattr", "fsetxattr", "removexattr", "mount", "umount2")
+PROCESSES = ("execve", "execveat", "?fork", "?vfork", "clone", "?clone3", "kill", "tkill", "tgkill",
+             "?pidfd_send_signal", "rt_sigqueueinfo", "ptrace")
+DEVICES = ("ioctl", "settimeofday", "clock_settime", "adjtimex", "clock_adjtime", "reboot",
+           "sethostname")
+OUTPUT = ("write", "pwrite64", "writev", "pwritev", "sendfile", "socket", "connect", "bind",
+          "sendto", "sendmsg", "?sendmmsg")
+
+# The service ignores it, and strace tells of it.
+MARK = signal.SIGURG
+
+# A thread of GLib's, and the wake-up of a loop in another thread.
+THREAD = re.compile(r"clone3?\(.*CLONE_THREAD")
+WAKE_UP = re.compile(r'write\(\d+, "\\1\\0\\0\\0\\0\\0\\0\\0", 8[) ]')
+LOG_LINE = re.compile(r'write\(1, "warning: Authorization check failed: ')
+RESUMED = re.compile(r"<\.\.\. \w+ resumed>")
+
+
+class EffectsTrace(Attached):
+    """A tracer that can be asked what was done since it was last asked."""
+
+    def __init__(self, pid: int, file: Path) -> None:
+        super().__init__(pid, file, ",".join(FILES + PROCESSES + DEVICES + OUTPUT))
+        self._service = pid
+        self._output = file
+        self._sockets = sockets_of(pid)
+        self._read = 0
+        self.calls_seen = 0
+
+    def since_last(self) -> list[str]:
+        """What was begun up to now."""
+        os.kill(self._service, MARK)
+        wait_for("the mark in the trace", self._is_marked)
+        with self._output.open() as trace:
+            trace.seek(self._read)
+            lines = trace.read().splitlines()
+            self._read = trace.tell()
+        calls = [re.sub(r" +", " ", line.split(maxsplit=1)[1]) for line in lines]
+        self.calls_seen += len(calls)
+        return calls
+
+    def _is_marked(self) -> bool:
+        with self._output.open() as trace:
+            trace.seek(self._read)
+            return f"--- {MARK.name} " in trace.read()
+
+    def effects(self) -> list[str]:
+        """What is no talk with the bus over the connections that the service had at the start, no
+        log line of a refusal and no thread."""
+        return [call for call in self.since_last() if not self._is_harmless(call)]
+
+    def _is_harmless(self, call: str) -> bool:
+        if call.startswith(("---", "+++")) or RESUMED.match(call) or THREAD.match(call):
+            return True
+        if match := re.match(r"send(to|msg|mmsg)\((\d+),", call):
+            return int(match[2]) in self._sockets
+        return bool(WAKE_UP.match(call) or LOG_LINE.match(call))
+
+
+def sockets_of(pid: int) -> set[int]:
+    """The descriptors that are sockets."""
+    folder = Path(f"/proc/{pid}/fd")
+    return {int(entry.name) for entry in folder.iterdir()
+            if os.readlink(entry).startswith("socket:")}

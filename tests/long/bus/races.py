@@ -1,0 +1,340 @@
+"""tests/long/bus/races.py: callers that vanish, and others that write the account files.
+
+A trial is one connection that is made to be left, or one change that somebody races with; 0 of the
+refused ones may do anything.
+"""
+import json
+import random
+import subprocess
+import threading
+import time
+from collections import Counter
+from pathlib import Path
+from typing import Callable, Iterator
+
+import pytest
+from gi.repository import Gio, GLib
+
+from account_watch import require_agreement, rows
+from bus_monitor import BUS, CALL, ERROR, Monitor
+from harness.accounts import (CLERK_UID, GROUP, PASSWD, SHADOW, STANDARD_GROUP, STANDARD_PASSWD,
+                              STANDARD_SHADOW, AccountFiles)
+from harness.bus import INTERFACE, NAME, PATH, Bus
+from harness.deadline import wait_for
+from harness.device import SYSFLASH, Device
+from harness.interface import METHODS, QUERIES
+from harness.sandbox import PYTHON, SYSTEM_BUS
+from harness.service import Service
+from harness.stage import PIDOF, Stage
+from harness.stage_fixtures import run_stage
+from harness.syslog_socket import SyslogSocket
+from harness.wire import NO_CAPABILITIES
+from pipeline import Call, Pipeline
+from polkit_control import NAME as POLKIT
+from other_writers import Outsider, Reader
+from surroundings import differences, world
+
+# Of the trials; those of the refused callers are the rest.
+ALLOWED_SHARE, WRITERS_SHARE = 0.04, 0.04
+SINGLE_TRIALS = 3
+
+RACERS = 3
+WARNING = "warning: Authorization check failed: "
+
+# What was sent on a connection that then ended, the bus may drop unread.
+LEAST_ARRIVALS = 0.3
+
+LINGER_MS = 60
+SETTLE_SECONDS = 10.0
+
+# The actions that somebody who means harm would ask for.
+TEMPTING = {
+    "AddUser": ("evil", "secret", "root", "privane", ""),
+    "AddUidUser": ("evil", "secret", "root", "privane", "", 1500),
+    "AddSystemUser": ("evil", "secret", "root", ["privane"], "/bin/sh", ""),
+    "ModifyUser": ("root", "mine now", "", [], "", ""),
+    "ChpasswdUser": ("root", "mine now"),
+    "ClearUserFields": ("root", True, True, True),
+    "RemoveUser": ("viewer",),
+}
+
+
+class Polkit:
+    """In the place of a fake library: polkit itself decides."""
+
+    def environment(self) -> dict[str, str]:
+        return {}
+
+
+@pytest.fixture
+def stage(accounts: AccountFiles, device: Device, hardware_clock: Path,
+          start: Callable[..., Service], bus: Bus, syslog: SyslogSocket,
+          tmp_path: Path) -> Iterator[Stage]:
+    accounts.write(STANDARD_PASSWD, STANDARD_SHADOW.replace(":7:::", ":7:0::"), STANDARD_GROUP)
+    yield from run_stage(Stage(start, bus, Polkit(), syslog, tmp_path, others=device.fakes()))
+
+
+@pytest.fixture
+def monitor() -> Iterator[Monitor]:
+    listener = Monitor()
+    yield listener
+    listener.close()
+
+
+def share(amount: int, part: float) -> int:
+    return max(4, int(amount * part))
+
+
+def rest(amount: int) -> list[int]:
+    """The trials of each racer."""
+    others = share(amount, ALLOWED_SHARE) + share(amount, WRITERS_SHARE) + SINGLE_TRIALS
+    left = max(RACERS, amount - others)
+    return [left // RACERS + (number < left % RACERS) for number in range(RACERS)]
+
+
+def blob(serial: int, destination: str, path: str, interface: str, member: str,
+         body: GLib.Variant | None = None) -> bytes:
+    message = Gio.DBusMessage.new_method_call(destination, path, interface, member)
+    message.set_serial(serial)
+    if body is not None:
+        message.set_body(body)
+    return message.to_blob(NO_CAPABILITIES)
+
+
+def beginning(uid: int) -> bytes:
+    """All that a connection says before its first call, without waiting for an answer."""
+    return (b"\0AUTH EXTERNAL " + str(uid).encode().hex().encode() + b"\r\nBEGIN\r\n"
+            + blob(1, BUS, "/org/freedesktop/DBus", BUS, "Hello"))
+
+
+def tempting_calls() -> list[bytes]:
+    return [blob(2, NAME, PATH, INTERFACE, method.member,
+                 GLib.Variant(f"({method.signature})",
+                              tuple(TEMPTING.get(method.member, method.arguments))))
+            for method in METHODS if method not in QUERIES]
+
+
+class Racer:
+    """A process of clerk, who is in the group privane and has no role."""
+
+    def __init__(self, gid: int, trials: int, seed: int) -> None:
+        self._process = subprocess.Popen(
+            ["setpriv", f"--reuid={CLERK_UID}", f"--regid={CLERK_UID}", f"--groups={gid}", "--",
+             PYTHON, str(Path(__file__).with_name("racer.py"))],
+            stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True)
+        assert self._process.stdin is not None
+        json.dump({"socket": SYSTEM_BUS.removeprefix("unix:path="), "trials": trials,
+                   "seed": seed, "begin": beginning(CLERK_UID).hex(),
+                   "calls": [call.hex() for call in tempting_calls()]}, self._process.stdin)
+        self._process.stdin.write("\n")
+        self._process.stdin.flush()
+
+    def is_running(self) -> bool:
+        return self._process.poll() is None
+
+    def result(self) -> dict[str, int]:
+        assert self._process.stdout is not None and self._process.stdin is not None
+        result: dict[str, int] = json.loads(self._process.stdout.read())
+        self._process.stdin.close()
+        assert self._process.wait(10) == 0
+        return result
+
+
+def settle(bus: Bus, service: Service, monitor: Monitor) -> list[str]:
+    """Waits until the service has told of every call that reached it, or has told enough not to
+    have; what it told."""
+    end = time.monotonic() + SETTLE_SECONDS
+    while len(warnings(service)) != len(foreign_calls(bus, monitor)) and time.monotonic() < end:
+        assert service.is_running(), service.output()[-3:]
+        assert bus.call("CheckUser", "s", "root") == (True,)
+    return warnings(service)
+
+
+def warnings(service: Service) -> list[str]:
+    return [line for line in service.output() if line.startswith(WARNING)]
+
+
+def foreign_calls(bus: Bus, monitor: Monitor) -> list[str]:
+    """The members called by others than this process's own connections."""
+    root = {seen.sender for seen in monitor.since(0) if seen.member == "CheckUser"}
+    return [str(seen.member) for seen in monitor.since(0)
+            if seen.type == CALL and seen.destination == NAME and seen.sender not in root]
+
+
+def test_refused_callers_that_vanish(stage: Stage, device: Device, monitor: Monitor,
+                                     privane_gid: int, chance: random.Random, amount: int,
+                                     figures: Counter[str]) -> None:
+    bus, service = stage.bus, stage.service
+    unique_name = bus.owner()
+    assert bus.call("CheckUser", "s", "root") == (True,)
+    begin_output, before = service.output(), world(stage.cfgstore)
+    racers = [Racer(privane_gid, trials, chance.getrandbits(32)) for trials in rest(amount)]
+    mark = monitor.mark()
+
+    while any(racer.is_running() for racer in racers):
+        # Root comes right after one that went: allowed as itself, and nobody else is by that.
+        line = Pipeline()
+        serial = line.send("CheckUser", "s", "root")
+        assert [message.body for message in line.until_reply(serial)] == [(True,)]
+        line.close()
+        figures["roots_in_between"] += 1
+    results = [racer.result() for racer in racers]
+    told = settle(bus, service, monitor)
+
+    after = world(stage.cfgstore)
+    assert after == before, differences(before, after)
+    assert stage.calls() == []
+    assert service.output() == begin_output + told
+    require_only_refusals(monitor, mark, unique_name)
+    require_new_names(monitor)
+    arrived = len(foreign_calls(bus, monitor))
+    assert arrived == len(told)
+    assert arrived > LEAST_ARRIVALS * sum(result["whole"] for result in results)
+    figures["trials"] += sum(result["trials"] for result in results)
+    figures["calls_sent"] += sum(result["whole"] for result in results)
+    figures["calls_arrived"] += arrived
+    figures["gone_when_asked_for"] += sum("uid is not known" in line or "no such name" in line
+                                          for line in told)
+    figures["executed"] += 0
+    assert bus.call("Reboot") == (0,)
+    assert stage.calls() == [(SYSFLASH, "reboot")], "a reset was armed"
+
+
+def require_only_refusals(monitor: Monitor, mark: int, service: str | None) -> None:
+    """The service said nothing but errors, questions, and the answers to root."""
+    names = {seen.arguments[1] for seen in monitor.since(0) if seen.member == "NameOwnerChanged"
+             and seen.arguments[0] == POLKIT}
+    for seen in monitor.since(mark):
+        if seen.sender == service and seen.type == CALL:
+            assert seen.destination in {BUS, POLKIT, *names} or seen.member in (
+                "CheckAuthorization", "CancelCheckAuthorization"), seen
+        elif seen.sender == service and seen.type != ERROR:
+            assert seen.arguments == (True,), seen
+
+
+def require_new_names(monitor: Monitor) -> None:
+    """No unique name is given twice."""
+    given = Counter(seen.arguments[0] for seen in monitor.since(0)
+                    if seen.member == "NameOwnerChanged" and str(seen.arguments[0]).startswith(":")
+                    and seen.arguments[1] == "")
+    assert given and max(given.values()) == 1, given.most_common(3)
+
+
+def is_there(name: str) -> tuple[bool, ...]:
+    """Whether the account stands in each of the three files."""
+    in_users = tuple(any(row[0] == name for row in rows(path)) for path in (PASSWD, SHADOW))
+    return *in_users, any(name in row[3].split(",") for row in rows(GROUP))
+
+
+def call_and_vanish(call: Call, delay: float) -> None:
+    line = Pipeline()
+    line.start(call)
+    threading.Event().wait(delay)
+    line.close()
+
+
+def test_allowed_callers_that_vanish(stage: Stage, device: Device, monitor: Monitor,
+                                     chance: random.Random, amount: int,
+                                     figures: Counter[str]) -> None:
+    """A change is made wholly, with all that belongs to it, or not at all."""
+    signature = next(method.signature for method in METHODS if method.member == "AddUser")
+    for number in range(share(amount, ALLOWED_SHARE)):
+        name = f"race{number}"
+        call_and_vanish(Call("method", "AddUser", signature,
+                             (name, "secret", "clerk", "privane-viewer", "")),
+                        chance.choice((0, 0, chance.uniform(0, 0.008))))
+        for _ in range(3):
+            stage.bus.call("CheckUser", "s", name)
+        (exists,) = stage.bus.call("CheckUser", "s", name)
+        assert is_there(name) == (exists,) * 3, name
+        users, *_ = require_agreement()
+        assert stage.bus.call("GetUserList") == (users,)
+        tools = [words[0] for words in stage.calls()]
+        assert tools == (["digest_entry_set", PIDOF] if exists else []), (name, stage.calls())
+        figures["changes_made" if exists else "changes_not_made"] += 1
+        figures["trials"] += 1
+        stage.digest.forget()
+        stage.pidof.forget()
+        if exists:
+            stage.bus.call("RemoveUser", "s", name)
+            stage.digest.forget()
+            stage.pidof.forget()
+    assert figures["changes_made"] > 0
+
+
+@pytest.mark.parametrize("member, tool", [("Reboot", SYSFLASH),
+                                          ("ExecuteLldpcli", "/usr/sbin/lldpcli")])
+def test_caller_that_vanishes_while_a_tool_runs(member: str, tool: str, stage: Stage,
+                                                device: Device, figures: Counter[str]) -> None:
+    method = next(method for method in METHODS if method.member == member)
+    stand_in = device.tools[tool]
+    stand_in.answer("linger", LINGER_MS)
+    line = Pipeline()
+    line.start(Call("method", member, method.signature, method.arguments))
+    wait_for("the tool's start", stand_in.calls)
+    line.close()
+
+    assert stage.bus.call("CheckUser", "s", "root") == (True,)
+    assert len(stand_in.calls()) == 1
+    require_agreement()
+    figures["trials"] += 1
+
+
+def test_another_writer(stage: Stage, amount: int, figures: Counter[str]) -> None:
+    """The service is the only writer, and says so where another one comes: but what either
+    writes, it writes whole."""
+    outsider, reader = Outsider(), Reader()
+    names = [f"both{number}" for number in range(share(amount, WRITERS_SHARE))]
+    try:
+        for name in names:
+            stage.bus.call("AddUser", "sssss", name, "secret", "clerk", "privane-viewer", "")
+            stage.bus.call("RemoveUser", "s", name)
+            figures["trials"] += 1
+    finally:
+        outsider.end()
+        reader.end()
+    assert not reader.torn, reader.torn[:3]
+    assert outsider.changes > 3 and reader.looks > 3
+    told = [text for _, text in stage.syslog.texts()]
+    lost = "/etc/passwd was changed by another program; its changes are lost"
+    assert told.count(lost) > 0
+    figures["changes_of_another"] += outsider.changes
+    figures["looks"] += reader.looks
+    # One more change of the service's own, and the files are those of its database.
+    stage.bus.call("AddUser", "sssss", "last", "secret", "clerk", "privane-viewer", "")
+    users, groups, *_ = require_agreement()
+    assert stage.bus.call("GetUserList") == (users,)
+    assert stage.bus.call("GetGroupList") == (groups,)
+    assert is_there("last") == (True,) * 3
+
+
+def test_second_instance(stage: Stage, start: Callable[..., Service], bus: Bus,
+                         chance: random.Random, amount: int, figures: Counter[str]) -> None:
+    """It waits for the name and touches nothing; when the first is gone it serves from the files
+    as they were at its start, and warns before it writes."""
+    first = bus.owner()
+    before = world(stage.cfgstore)
+    second = start(environment=stage.environment)
+    wait_for("the second in the queue", lambda: len(bus.queue()) == 2)
+    after = world(stage.cfgstore)
+    assert (after.files, after.folders["/etc"]) == (before.files, before.folders["/etc"])
+    assert bus.owner() == first
+
+    bus.call("AddUser", "sssss", "early", "secret", "clerk", "privane-viewer", "")
+    require_agreement()
+    stage.service.stop()
+    second.wait_registered(bus)
+    assert (bus.call("CheckUser", "s", "early"), "early" in PASSWD.read_text()) == ((False,), True)
+    bus.call("AddUser", "sssss", "late", "secret", "clerk", "privane-viewer", "")
+    users, *_ = require_agreement()
+    assert bus.call("GetUserList") == (users,)
+    assert "/etc/passwd was changed by another program; its changes are lost" in [
+        text for _, text in stage.syslog.texts()]
+    assert second.stop() == 0
+    stage.start()
+    figures["trials"] += 1
+
+
+def test_all_was_tried(figures: Counter[str], amount: int) -> None:
+    assert figures["trials"] >= amount
+    assert figures["executed"] == 0

@@ -1,0 +1,21 @@
+"""tests/long/bus/surroundings.py: what lies around the service, for proofs that nothing moved."""
+from dataclasses import replace
+from typing import Any
+
+from harness.world import Neighbour, World, snapshot
+
+
+def world(*neighbours: Neighbour) -> World:
+    """Without the count of processes: polkitd and the proofs start some. In "/" only names count,
+    and "/tmp" does not: there this machine's own folders may be seen, and others work in them."""
+    seen = snapshot(*neighbours)
+    folders = {path: entries for path, entries in seen.folders.items() if path != "/tmp"}
+    folders["/"] = {name: (0, 0, 0) for name in folders["/"]}
+    return replace(seen, last_pid=0, folders=folders)
+
+
+def differences(before: World, after: World) -> list[Any]:
+    """What is in one of them alone."""
+    pairs = [(before.files, after.files), (before.signals, after.signals),
+             *((before.folders[path], after.folders[path]) for path in before.folders)]
+    return [set(old.items()) ^ set(new.items()) for old, new in pairs if old != new]
