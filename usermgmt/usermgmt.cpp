@@ -1,8 +1,10 @@
 // usermgmt/usermgmt.cpp: opening, closing, reloading and writing the database.
 #include "usermgmt/usermgmt.h"
 
+#include <cerrno>
 #include <type_traits>
 
+#include <sys/stat.h>
 #include <syslog.h>
 
 #include "usermgmt/context.h"
@@ -43,6 +45,13 @@ static void usermgmt_ctx_free(usermgmt_ctx *ctx) {
     g_free(ctx);
 }
 
+// A file that cannot be looked at counts as there, so that reading it fails: taken for missing, it
+// would cost every user whose password it holds.
+static bool shadow_file_exists() {
+    struct stat st;
+    return stat(core_file_table[CORE_FILE_ROW_SHADOW].path, &st) == 0 || errno != ENOENT;
+}
+
 usermgmt_ctx *usermgmt_open(guint32 flags, GError **error) {
     if ((flags & USERMGMT_OPEN_TRYLOCK) == 0) {
         g_mutex_lock(&open_lock);
@@ -55,8 +64,7 @@ usermgmt_ctx *usermgmt_open(guint32 flags, GError **error) {
     auto *ctx = g_new0(usermgmt_ctx, 1);
     g_mutex_init(&ctx->mutex);
     ctx->open_flags = flags;
-    ctx->has_shadow =
-        g_file_test(core_file_table[CORE_FILE_ROW_SHADOW].path, G_FILE_TEST_EXISTS) ? TRUE : FALSE;
+    ctx->has_shadow = shadow_file_exists() ? TRUE : FALSE;
     if (!group_database_init(ctx, TRUE, error) || !user_database_init(ctx, error)) {
         g_prefix_error(error, "Could not initialise user management: ");
         usermgmt_ctx_free(ctx);

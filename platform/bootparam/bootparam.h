@@ -50,7 +50,7 @@ int bootparam_read(const char *name, char **value, int flags, int *error,
 /* Adds or replaces a parameter. The name is not empty, has no "=" and is not ".flags", U-Boot's
  * list of what others may hold; neither has a control character, and the value is not empty, which
  * would delete the parameter. On success the value is on the disk. On failure the old one is still
- * there, but for EIO, after which either may be. */
+ * there, but where some of a copy was written or was not synced, as with EIO: either may be. */
 int bootparam_write(const char *name, const char *value, int *error, struct bootparam_chip *chip);
 
 #pragma GCC visibility pop

@@ -48,9 +48,9 @@ def on_bus(name: str, build: str = "build") -> tuple[str, ...]:
 
 PROOFS: tuple[Proof, ...] = (
     Proof("kill_points", ("build/tests/long/faults/kill_points",), "points",
-          gate=2_500, step=20_000, aim=200_000, full=2_000_000),
+          gate=12_000, step=50_000, aim=200_000, full=2_000_000),
     Proof("failing_calls", ("build/tests/long/faults/failing_calls",), "faults",
-          gate=6_000, step=20_000, aim=50_000, full=500_000),
+          gate=17_000, step=50_000, aim=200_000, full=2_000_000),
     Proof("daemon_kills", on_bus("daemon_kills"), "points",
           gate=300, step=1_000, aim=12_500, full=25_000),
     Proof("power_cuts", ("tests/long/power/power_cuts",), "states",

@@ -74,11 +74,11 @@ void account_model::load_users() {
     }
 }
 
-void account_model::reload(guint32 mask) {
+void account_model::reload(guint32 mask, const operation_result &result) {
     const bool users = (mask & (LOAD_PASSWD | LOAD_SHADOW)) != 0;
-    if ((mask & LOAD_GROUP) != 0 || (users && no_cache()))
+    if (!result.groups_unread && ((mask & LOAD_GROUP) != 0 || (users && no_cache())))
         load_groups();
-    if (users)
+    if (!result.users_unread && users)
         load_users();
     reloaded_ = reloaded_ || mask != 0;
 }
@@ -137,7 +137,7 @@ void account_model::follow(const operation &what, const operation_result &result
         groups_dirty_ = false;
     } else {
         write(result.fault_struck ? what.fault->replaced : 0);
-        reload(request.mask);
+        reload(request.mask, result);
     }
 }
 

@@ -50,6 +50,9 @@ struct operation_result {
     bool fault_struck;     // the planned fault was met
     std::string new_hash;  // the last that was made
     gint64 now;
+    // What a reload, where the operation asked for one, could not read.
+    bool groups_unread = false;
+    bool users_unread = false;
 };
 
 // Whether an operation succeeds it is told; what follows from that it knows.
@@ -82,7 +85,7 @@ class account_model {
 
     void load_groups();
     void load_users();
-    void reload(guint32 mask);
+    void reload(guint32 mask, const operation_result &result);
     // Replaces the files of the first rows, as far as they are to be written.
     void write(int rows);
 

@@ -10,7 +10,8 @@ static bool contains(const std::string &text, const char *part) {
 
 // Refused where the groups are changed already.
 static bool is_password_refused(const std::string &error) {
-    return contains(error, "crypt() failed") || contains(error, "invalid password of size 0");
+    return contains(error, "crypt() failed") || contains(error, "invalid password of size 0") ||
+           contains(error, "could not create password salt");
 }
 
 account_model::write_request account_model::change(const operation &what,
@@ -39,13 +40,13 @@ void account_model::refused(const operation &what, const operation_result &resul
     if (!what.account)
         return;
     if (what.kind == operation_kind::delete_group && contains(result.error, "out of sync")) {
-        reload(LOAD_EVERYTHING);
+        reload(LOAD_EVERYTHING, result);
     } else if (what.kind == operation_kind::modify_user) {
         guint32 pending =
             contains(result.error, ", primary group (") ? guint32{LOAD_EVERYTHING} : 0;
         if (is_password_refused(result.error))
             pending = modify_user(what, result).mask;
-        reload(pending | (users_dirty_ ? 1U : 0U) | (groups_dirty_ ? 2U : 0U));
+        reload(pending | (users_dirty_ ? 1U : 0U) | (groups_dirty_ ? 2U : 0U), result);
     }
 }
 

@@ -1,8 +1,10 @@
 // tests/unit/usermgmt/open_close_test.cpp: one context at a time, from open to close.
 #include <atomic>
+#include <cerrno>
 #include <thread>
 
 #include "tests/unit/usermgmt/account_files.h"
+#include "tests/unit/usermgmt/io_trace.h"
 #include "tests/unit/usermgmt/secret_watch.h"
 #include "usermgmt/context.h"
 
@@ -25,6 +27,23 @@ TEST_F(OpenClose, OpenedContextIsInitialised) {
     EXPECT_TRUE(ctx->initialised);
     EXPECT_TRUE(ctx->has_shadow);
     EXPECT_EQ(ctx->open_flags, guint32{USERMGMT_OPEN_STRICT} | USERMGMT_OPEN_TRYLOCK);
+}
+
+// Taken for missing, it would cost every user whose password it holds.
+TEST_F(OpenClose, ShadowFileThatCannotBeLookedAtIsNoMissingOne) {
+    for (const int error : {EIO, EACCES, EINTR, ENOTDIR}) {
+        SCOPED_TRACE(error);
+        io_trace trace;
+        trace.fail("stat", "etc/shadow", 1, error);
+        const open_context ctx = opened();
+        ASSERT_NE(ctx, nullptr);
+        EXPECT_TRUE(trace.has_struck());
+        EXPECT_TRUE(ctx->has_shadow);
+        EXPECT_TRUE(usermgmt_user_exists(ctx.get(), "root"));
+    }
+    remove("shadow");
+    EXPECT_FALSE(open_context(usermgmt_open(USERMGMT_OPEN_TRYLOCK, nullptr))->has_shadow);
+    (void)take_syslog();  // whose password it held
 }
 
 TEST_F(OpenClose, TryingWhileOpenFails) {

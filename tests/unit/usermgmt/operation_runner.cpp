@@ -8,6 +8,8 @@
 #include <algorithm>
 #include <cerrno>
 
+#include "tests/unit/usermgmt/operation_call.h"
+
 operation_runner::operation_runner() {
     sources_.stand_in = cheap_hash;
     sources_.pid = 42;
@@ -45,48 +47,6 @@ std::string operation_runner::start(const starting_files &files, char salt_lette
     ctx_.reset(usermgmt_open(files.open_flags | USERMGMT_OPEN_TRYLOCK, error.out()));
     (void)take_syslog();  // the lines that were skipped
     return error.is_set() ? error.text() : model_->difference_from(ctx_.get());
-}
-
-static const char *or_null(const optional_text &text) {
-    return text ? text->c_str() : nullptr;
-}
-
-bool operation_runner::call(const operation &what, GError **error) {
-    const char *account = or_null(what.account);
-    std::vector<const char *> names;
-    if (what.names)
-        for (const std::string &name : *what.names)
-            names.push_back(name.c_str());
-    entry_fields fields = {
-        what.type,    or_null(what.name),  or_null(what.password), or_null(what.group),
-        std::nullopt, or_null(what.gecos), or_null(what.shell),    what.uid};
-    if (what.names)
-        fields.groups = names;
-    const filled_entry entry(fields);
-    names.push_back(nullptr);
-
-    switch (what.kind) {
-        case operation_kind::add_user:
-            return usermgmt_add_user(ctx_.get(), account, entry.get(), error);
-        case operation_kind::modify_user: {
-            gboolean done = FALSE;
-            const lines warnings = glib_log_of(
-                [&] { done = usermgmt_modify_user(ctx_.get(), account, entry.get(), error); });
-            glib_warnings_ = warnings.size();
-            return done;
-        }
-        case operation_kind::delete_user:
-            return usermgmt_delete_user(ctx_.get(), account, error);
-        case operation_kind::disable_password:
-            return usermgmt_disable_password(ctx_.get(), account, error);
-        case operation_kind::add_group:
-            return usermgmt_add_group(ctx_.get(), account, names.data(), error);
-        case operation_kind::delete_group:
-            return usermgmt_delete_group(ctx_.get(), account, error);
-        case operation_kind::reopen:
-            break;
-    }
-    return false;
 }
 
 void operation_runner::count(const operation &what, const operation_result &result) {
@@ -186,7 +146,9 @@ std::string operation_runner::run(const operation &what) {
             trace.emplace();
             trace->fail(what.fault->call, what.fault->path, what.fault->nth, EIO);
         }
-        result.succeeded = call(what, error.out());
+        lines warnings;
+        result.succeeded = call_operation(ctx_.get(), what, &warnings, error.out());
+        glib_warnings_ = warnings.size();
         result.fault_struck = trace && trace->has_struck();
         result.error = error.text();
         result.new_hash = sources_.hashes.empty() ? "" : sources_.hashes.back();

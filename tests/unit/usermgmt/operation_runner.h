@@ -37,7 +37,6 @@ class operation_runner {
     std::string check_lines(int row);
     std::string check_root() const;
 
-    bool call(const operation &what, GError **error);
     void count(const operation &what, const operation_result &result);
 
     hashing_sources sources_;

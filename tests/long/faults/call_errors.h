@@ -1,0 +1,18 @@
+// tests/long/faults/call_errors.h: how each file-system call can fail.
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "tests/long/faults/call_trap.h"
+
+struct call_fault {
+    int error;              // 0: a short write
+    int error_after_short;  // of the next write, 0: none
+    bool for_ever;
+};
+
+// All that apply to the call. An interruption ends some time, so it comes once.
+std::vector<call_fault> faults_of(const trapped_call &call);
+
+std::string shown(const call_fault &fault);

@@ -1,0 +1,296 @@
+// tests/long/faults/call_trap.cpp: the file-system calls of this process, caught by a filter of the
+// kernel, which raises SIGSYS in their place.
+#include "tests/long/faults/call_trap.h"
+
+#include <cerrno>
+#include <csignal>
+#include <cstdio>
+#include <cstring>
+#include <iterator>
+
+#include <fcntl.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <sys/mman.h>
+#include <sys/prctl.h>
+#include <sys/syscall.h>
+#include <ucontext.h>
+#include <unistd.h>
+
+// A call with this as its sixth argument, which none of these calls has, is the trap's own.
+static constexpr unsigned long OWN_CALL = 0x2ea7c0de;
+
+enum class takes { PATH, FOLDER_AND_PATH, DESCRIPTOR };
+
+struct known_call {
+    long number;
+    const char *name;
+    takes first;
+};
+
+#define AT(call, name) \
+    { SYS_##call, name, takes::FOLDER_AND_PATH }
+#define ON(call, name) \
+    { SYS_##call, name, takes::DESCRIPTOR }
+static constexpr known_call known_calls[] = {
+    AT(openat, "open"),
+    AT(newfstatat, "stat"),
+    AT(statx, "stat"),
+    AT(renameat, "rename"),
+    AT(renameat2, "rename"),
+    AT(unlinkat, "unlink"),
+    AT(mkdirat, "mkdir"),
+    AT(faccessat, "access"),
+    AT(faccessat2, "access"),
+    AT(fchmodat, "chmod"),
+    AT(fchownat, "chown"),
+    AT(symlinkat, "symlink"),
+    ON(read, "read"),
+    ON(pread64, "read"),
+    ON(readv, "read"),
+    ON(write, "write"),
+    ON(pwrite64, "write"),
+    ON(writev, "write"),
+    ON(close, "close"),
+    ON(fstat, "fstat"),
+    ON(fchmod, "fchmod"),
+    ON(fchown, "fchown"),
+    ON(fsync, "fsync"),
+    ON(fdatasync, "fsync"),
+    ON(flock, "flock"),
+    ON(fcntl, "fcntl"),
+    ON(lseek, "lseek"),
+    ON(ftruncate, "truncate"),
+    ON(ioctl, "ioctl"),
+    ON(getdents64, "list"),
+#ifdef SYS_open  // Newer machines have only the calls above.
+    {SYS_open,     "open",     takes::PATH},
+    {SYS_creat,    "open",     takes::PATH},
+    {SYS_stat,     "stat",     takes::PATH},
+    {SYS_lstat,    "stat",     takes::PATH},
+    {SYS_access,   "access",   takes::PATH},
+    {SYS_rename,   "rename",   takes::PATH},
+    {SYS_unlink,   "unlink",   takes::PATH},
+    {SYS_mkdir,    "mkdir",    takes::PATH},
+    {SYS_chmod,    "chmod",    takes::PATH},
+    {SYS_chown,    "chown",    takes::PATH},
+    {SYS_truncate, "truncate", takes::PATH},
+    {SYS_link,     "link",     takes::PATH},
+    {SYS_symlink,  "symlink",  takes::PATH},
+#endif
+};
+#undef AT
+#undef ON
+
+static constexpr int MAX_DESCRIPTORS = 128;
+static constexpr std::size_t PATH_SIZE = sizeof(trapped_call::path);
+
+// Only the process's one thread works on these.
+static call_trace *trace;
+static trap_plan plan;
+static char known_folder[PATH_SIZE];
+static char paths[MAX_DESCRIPTORS][PATH_SIZE];
+static char failing_line[sizeof(trapped_call::name) + PATH_SIZE + 1];
+static int failing_error;
+
+call_trace *make_shared_trace() {
+    void *memory = mmap(nullptr, sizeof(call_trace), PROT_READ | PROT_WRITE,
+                        MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+    return memory != MAP_FAILED ? static_cast<call_trace *>(memory) : nullptr;
+}
+
+static const known_call *find_call(long number) {
+    for (const known_call &row : known_calls)
+        if (row.number == number)
+            return &row;
+    return nullptr;
+}
+
+static bool is_labelled(long fd) {
+    return fd >= 0 && fd < MAX_DESCRIPTORS && paths[fd][0] != '\0';
+}
+
+static void take_path(char *to, const char *path) {
+    const std::size_t length = std::strlen(known_folder);
+    if (length > 0 && std::strncmp(path, known_folder, length) == 0 && path[length] == '/')
+        path += length + 1;
+    (void)std::snprintf(to, PATH_SIZE, "%s", path);
+}
+
+static void take_path_in_folder(char *to, long folder, const char *path) {
+    if (path[0] == '\0' && is_labelled(folder))
+        (void)std::snprintf(to, PATH_SIZE, "%s", paths[folder]);
+    else if (path[0] != '/' && is_labelled(folder))
+        (void)std::snprintf(to, PATH_SIZE, "%.60s/%.50s", paths[folder], path);
+    else
+        take_path(to, path);
+}
+
+// The C library's own data, which it reads once in a process or not at all.
+static bool is_of_library(const trapped_call &call) {
+    return std::strncmp(call.path, "/usr/", 5) == 0;
+}
+
+// False for a call on something that was opened before the trap began.
+static bool describe(const known_call *row, const long *arguments, trapped_call *call) {
+    *call = {};
+    (void)std::snprintf(call->name, sizeof call->name, "%s", row->name);
+    if (row->first == takes::PATH) {
+        take_path(call->path, reinterpret_cast<const char *>(arguments[0]));
+        return true;
+    }
+    if (row->first == takes::FOLDER_AND_PATH) {
+        const char *path = reinterpret_cast<const char *>(arguments[1]);
+        if (path[0] == '\0')
+            (void)std::snprintf(call->name, sizeof call->name, "fstat");
+        take_path_in_folder(call->path, arguments[0], path);
+        return call->path[0] != '\0';
+    }
+    if (!is_labelled(arguments[0]))
+        return false;
+    (void)std::snprintf(call->path, PATH_SIZE, "%s", paths[arguments[0]]);
+    call->mode = row->number == SYS_fchmod ? static_cast<mode_t>(arguments[1]) : 0;
+    call->size = std::strcmp(row->name, "write") == 0 ? static_cast<std::size_t>(arguments[2]) : 0;
+    return true;
+}
+
+static long make_call(long number, const long *arguments) {
+    const long result = syscall(number, arguments[0], arguments[1], arguments[2], arguments[3],
+                                arguments[4], OWN_CALL);
+    return result >= 0 ? result : -errno;
+}
+
+[[noreturn]] static void die() {
+    (void)syscall(SYS_kill, syscall(SYS_getpid), SIGKILL);
+    _exit(99);
+}
+
+static bool is_on(const trapped_call &call, const char *name, const char *path) {
+    return name != nullptr && std::strcmp(call.name, name) == 0 &&
+           std::strcmp(call.path, path) == 0;
+}
+
+// The error of this call, 0 for none. A short write is told by *out_short.
+static int planned_error(const trapped_call &call, int index, bool *out_short) {
+    char line[sizeof failing_line];
+    (void)std::snprintf(line, sizeof line, "%s %s", call.name, call.path);
+    const bool fails_on = failing_line[0] != '\0' && std::strcmp(line, failing_line) == 0;
+
+    if (index == plan.fail_at) {
+        trace->struck = true;
+        *out_short = plan.error == 0;
+        if (plan.for_ever || plan.error_after_short != 0) {
+            std::memcpy(failing_line, line, sizeof line);
+            failing_error = plan.error != 0 ? plan.error : plan.error_after_short;
+        }
+        return plan.error;
+    }
+    if (fails_on)
+        return failing_error;
+    return is_on(call, plan.also_call, plan.also_path) ? plan.also_error : 0;
+}
+
+static void follow_descriptors(const trapped_call &call, const long *arguments) {
+    if (std::strcmp(call.name, "open") == 0 && call.result >= 0 && call.result < MAX_DESCRIPTORS)
+        std::memcpy(paths[call.result], call.path, PATH_SIZE);
+    else if (std::strcmp(call.name, "close") == 0 && is_labelled(arguments[0]))
+        paths[arguments[0]][0] = '\0';
+}
+
+static long follow_plan(const known_call *row, long *arguments, trapped_call *call) {
+    const int index = trace->count;
+    const bool is_write = call->size > 0;
+    if (index == plan.die_before) {
+        if (plan.torn && is_write) {
+            arguments[2] /= 2;
+            (void)make_call(row->number, arguments);
+        }
+        die();
+    }
+    bool cut = false;
+    const int error = planned_error(*call, index, &cut);
+    if (cut && is_write)
+        arguments[2] = (arguments[2] + 1) / 2;
+    // A failing close has still closed.
+    if (error == 0 || row->number == SYS_close)
+        call->result = make_call(row->number, arguments);
+    if (error != 0)
+        call->result = -error;
+    return call->result;
+}
+
+static long answer(long number, long *arguments) {
+    const known_call *row = find_call(number);
+    trapped_call call;
+    if (trace == nullptr || row == nullptr || !describe(row, arguments, &call) ||
+        is_of_library(call))
+        return make_call(number, arguments);
+
+    const long result = follow_plan(row, arguments, &call);
+    follow_descriptors(call, arguments);
+    if (trace->count < call_trace::MAX_CALLS)
+        trace->calls[trace->count] = call;
+    trace->count++;
+    return result;
+}
+
+static void on_trapped_call(int /*signal*/, siginfo_t *info, void *context) {
+    const int saved_errno = errno;
+    mcontext_t *machine = &static_cast<ucontext_t *>(context)->uc_mcontext;
+#if defined(__x86_64__)
+    const auto *registers = machine->gregs;
+    long arguments[] = {registers[REG_RDI], registers[REG_RSI], registers[REG_RDX],
+                        registers[REG_R10], registers[REG_R8]};
+    machine->gregs[REG_RAX] = answer(info->si_syscall, arguments);
+#elif defined(__aarch64__)
+    long arguments[5];
+    for (std::size_t i = 0; i < std::size(arguments); i++)
+        arguments[i] = static_cast<long>(machine->regs[i]);
+    machine->regs[0] = static_cast<unsigned long long>(answer(info->si_syscall, arguments));
+#else
+#error "where this machine keeps the arguments of a system call"
+#endif
+    errno = saved_errno;
+}
+
+bool install_call_trap() {
+    static constexpr std::size_t CALLS = std::size(known_calls);
+    // The end is the trap; the one before it lets the call pass.
+    sock_filter filter[CALLS + 5] = {
+        BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, args[5])),
+        BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, OWN_CALL, CALLS + 1, 0),
+        BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+    };
+    for (std::size_t i = 0; i < CALLS; i++)
+        filter[3 + i] =
+            BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, static_cast<unsigned>(known_calls[i].number),
+                     static_cast<unsigned char>(CALLS - i), 0);
+    filter[3 + CALLS] = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW);
+    filter[4 + CALLS] = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_TRAP);
+    const sock_fprog program = {static_cast<unsigned short>(std::size(filter)), filter};
+
+    struct sigaction action = {};
+    action.sa_sigaction = on_trapped_call;
+    action.sa_flags = SA_SIGINFO;
+    return sigaction(SIGSYS, &action, nullptr) == 0 &&
+           prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
+           prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program) == 0;
+}
+
+void begin_trap(call_trace *recorded, const trap_plan &wanted, const std::string &folder) {
+    std::memset(paths, 0, sizeof paths);
+    failing_line[0] = '\0';
+    (void)std::snprintf(known_folder, sizeof known_folder, "%s", folder.c_str());
+    plan = wanted;
+    recorded->count = 0;
+    recorded->struck = false;
+    trace = recorded;
+}
+
+void end_trap() {
+    trace = nullptr;
+}
+
+std::string line_of(const trapped_call &call) {
+    return std::string(call.name) + " " + call.path;
+}

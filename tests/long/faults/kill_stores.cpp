@@ -1,0 +1,153 @@
+// tests/long/faults/kill_stores.cpp: operations of the libraries that keep files, ended at any call
+// with the process.
+#include "tests/long/faults/kill_stores.h"
+
+#include <algorithm>
+#include <csignal>
+
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include "tests/long/faults/call_trap.h"
+#include "tests/long/faults/judgement.h"
+#include "tests/long/faults/store_cases.h"
+
+class store_killer {
+  public:
+    store_killer(proof_report *report, std::string folder, guint64 amount)
+        : report_(report), folder_(std::move(folder)), amount_(amount) {}
+
+    // Strikes at all points, and again from each state that this leaves.
+    void strike_all(const store_case &one);
+
+  private:
+    void strike_from(const folder_state &start);
+    bool rehearse();
+    void die(int before, bool torn);
+    std::string judge(int before, const folder_state &now);
+    std::string recover();
+
+    proof_report *report_;
+    std::string folder_;
+    guint64 amount_;
+    call_trace *rehearsal_ = make_shared_trace();
+    call_trace *last_ = make_shared_trace();
+    store_case one_;
+    folder_state start_;
+    folder_state after_;
+    std::string boot_before_;
+    std::string boot_after_;
+    std::vector<folder_state> states_;
+};
+
+bool store_killer::rehearse() {
+    // The C library reads some of its own files only once.
+    put_back_store(one_, start_);
+    (void)one_.run();
+    put_back_store(one_, start_);
+    boot_before_ = one_.file.empty() ? read_boot_block() : "";
+    begin_trap(rehearsal_, {}, folder_);
+    const int result = one_.run();
+    end_trap();
+    after_ = look_at_store(one_);
+    boot_after_ = one_.file.empty() ? read_boot_block() : "";
+    report_->count("operations");
+    const std::string wrong = judge_order_of_calls(*rehearsal_);
+    if (result == 0 && wrong.empty() && rehearsal_->count > 0)
+        return true;
+    report_->fail(one_.name + ": not stopped, it answers " + std::to_string(result) + ": " + wrong);
+    return false;
+}
+
+void store_killer::die(int before, bool torn) {
+    put_back_store(one_, start_);
+    const pid_t child = fork();
+    if (child == 0) {
+        trap_plan plan;
+        plan.die_before = before;
+        plan.torn = torn;
+        begin_trap(last_, plan, folder_);
+        (void)one_.run();
+        end_trap();
+        (void)raise(SIGKILL);
+    }
+    int status = 0;
+    if (child < 0 || waitpid(child, &status, 0) != child || !WIFSIGNALED(status) ||
+        WTERMSIG(status) != SIGKILL || last_->count != before)
+        report_->fail(one_.name + ": did not die before call " + std::to_string(before));
+}
+
+// The operation works when it is repeated, and ends as if it had not been stopped.
+std::string store_killer::recover() {
+    const int result = one_.run();
+    report_->count("operations");
+    if (result != 0)
+        return "repeated, it answers " + std::to_string(result);
+    if (one_.file.empty()) {
+        const std::string now = read_boot_block();
+        return now != boot_after_ ? "repeated, it leaves " + now : write_on_boot_block();
+    }
+    return state_difference(after_, look_at_store(one_), true);
+}
+
+std::string store_killer::judge(int before, const folder_state &now) {
+    if (one_.file.empty())
+        return judge_boot_block(boot_before_, boot_after_);
+    const stopped_replacement stopped = {&start_, &after_,     rehearsal_,
+                                         before,  {one_.file}, {one_.file + ".lock"}};
+    return judge_files(stopped, now);
+}
+
+void store_killer::strike_from(const folder_state &start) {
+    start_ = start;
+    if (!rehearse())
+        return;
+    for (int before = 0; before <= rehearsal_->count; before++) {
+        const bool is_write = before < rehearsal_->count && rehearsal_->calls[before].size > 1;
+        for (const bool torn : {false, true}) {
+            if (torn && !is_write)
+                continue;
+            if (report_->figure("points") >= amount_ || report_->is_hopeless())
+                return;
+            die(before, torn);
+            report_->count("points");
+            report_->count("torn_writes", torn ? 1 : 0);
+            report_->tell_progress("points");
+            const folder_state now = look_at_store(one_);
+            std::string wrong = judge(before, now);
+            if (wrong.empty() && std::find(states_.begin(), states_.end(), now) == states_.end()) {
+                states_.push_back(now);
+                report_->count("states");
+                wrong = recover();
+            }
+            if (!wrong.empty())
+                report_->fail(one_.name + ", killed before call " + std::to_string(before) + ", " +
+                              (before < rehearsal_->count ? line_of(rehearsal_->calls[before])
+                                                          : "its return") +
+                              (torn ? ", half written" : "") + ": " + wrong);
+        }
+    }
+}
+
+void store_killer::strike_all(const store_case &one) {
+    one_ = one;
+    states_.clear();
+    strike_from(one.files);
+    // Leftovers of others are no other states than those of this operation's own.
+    if (one.name.ends_with("leftover"))
+        return;
+    const std::vector<folder_state> crashed = states_;
+    for (const folder_state &state : crashed)
+        if (state != one.files && !report_->is_hopeless())
+            strike_from(state);
+}
+
+void kill_every_store_operation(proof_report *report, const std::string &folder, guint64 amount) {
+    store_killer killer(report, folder, amount);
+    for (const store_case &one : store_cases(folder)) {
+        const guint64 points = report->figure("points");
+        killer.strike_all(one);
+        if (report->figure("points") == points && points < amount)
+            report->fail(one.name + " was never struck");
+    }
+}
