@@ -11,6 +11,7 @@
 
 #include "platform/authz/authz.h"
 #include "platform/log_backend/log_backend.h"
+#include "service/intake.h"
 #include "service/method_table.h"
 #include "service/quit_signals.h"
 #include "service/request.h"
@@ -29,6 +30,8 @@ static void on_bus_acquired(GDBusConnection *connection, const char *, gpointer 
     auto *state = static_cast<ServiceState *>(user_data);
 
     state->connection = connection;
+    // Before there is anything to call.
+    intake_guard(connection, OBJECT_PATH, privane_system__interface_info());
     (void)g_dbus_interface_skeleton_export(G_DBUS_INTERFACE_SKELETON(state->skeleton), connection,
                                            OBJECT_PATH, nullptr);
     g_message("Policy Server now registered with the name '%s' and object '%s'", BUS_NAME,

@@ -21,11 +21,17 @@ static constexpr const char *ANSWER_TYPE = "((bba{ss}))";
 static constexpr guint32 NO_INTERACTION = 0;
 
 // For what the bus itself is asked besides, which it knows at once.
-static constexpr int BUS_DEADLINE_MS = 2000;
+static constexpr int BUS_DEADLINE_MS = 1000;
+
+// The bus drops an answer when others fill what it keeps for this process. So what is not answered
+// by then is asked once more; polkit takes its time, and any answer will do.
+static constexpr guint REPEAT_MS = 1000;
 
 enum class polkit_answer { ALLOWED, REFUSED, NEEDS_PASSWORD };
 
 static GDBusConnection *client_bus;
+// Of the questions alone: while one waits, nothing else of the program runs.
+static GMainContext *client_context;
 
 struct question {
     const char *sender;
@@ -33,6 +39,14 @@ struct question {
     const char *unit;         // null, or what the details tell of a unit
     const char *unit_action;  // and its own action
     gint64 deadline;
+};
+
+// A question that was asked, perhaps more than once.
+struct pending_check {
+    const question *asked;
+    GCancellable *cancellable;
+    GAsyncResult *result;  // the first
+    guint unanswered;
 };
 
 static int remaining_ms(gint64 deadline) {
@@ -45,10 +59,14 @@ static int remaining_ms(gint64 deadline) {
 static bool open_bus(GError **error) {
     if (client_bus == nullptr)
         client_bus = g_bus_get_sync(G_BUS_TYPE_SYSTEM, nullptr, error);
+    if (client_context == nullptr)
+        client_context = g_main_context_new();
     return client_bus != nullptr;
 }
 
-static GVariant *arguments_of(const question &asked, const char *cancellation_id) {
+// Nobody cancels a question by its name, so that it has none: a check without interaction ends by
+// itself.
+static GVariant *arguments_of(const question &asked) {
     GVariantBuilder identity;
     GVariantBuilder details;
 
@@ -60,34 +78,62 @@ static GVariant *arguments_of(const question &asked, const char *cancellation_id
         g_variant_builder_add(&details, "{ss}", "unit", asked.unit);
     }
     return g_variant_new("((sa{sv})sa{ss}us)", "system-bus-name", &identity, asked.action_id,
-                         &details, NO_INTERACTION, cancellation_id);
+                         &details, NO_INTERACTION, "");
 }
 
-// Nobody waits for the answer any more.
-static void cancel_question(const char *cancellation_id) {
-    g_dbus_connection_call(client_bus, POLKIT_NAME, AUTHORITY_PATH, AUTHORITY_INTERFACE,
-                           "CancelCheckAuthorization", g_variant_new("(s)", cancellation_id),
-                           nullptr, G_DBUS_CALL_FLAGS_NO_AUTO_START, -1, nullptr, nullptr, nullptr);
+static void on_answer(GObject *, GAsyncResult *result, void *data) {
+    auto *pending = static_cast<pending_check *>(data);
+
+    pending->unanswered--;
+    if (pending->result == nullptr)
+        pending->result = G_ASYNC_RESULT(g_object_ref(result));
 }
 
 // A sound answer is one of the right form; GDBus makes any other an error.
-static bool ask_once(const question &asked, polkit_answer *out_answer, GError **error) {
-    static guint questions = 0;
-    g_autofree char *cancellation_id = g_strdup_printf("question-%u", ++questions);
-    g_autoptr(GError) cause = nullptr;
-    g_autoptr(GVariant) answer = g_dbus_connection_call_sync(
+static void send_question(pending_check *pending) {
+    pending->unanswered++;
+    g_dbus_connection_call(
         client_bus, POLKIT_NAME, AUTHORITY_PATH, AUTHORITY_INTERFACE, "CheckAuthorization",
-        arguments_of(asked, cancellation_id), G_VARIANT_TYPE(ANSWER_TYPE), G_DBUS_CALL_FLAGS_NONE,
-        remaining_ms(asked.deadline), nullptr, &cause);
+        arguments_of(*pending->asked), G_VARIANT_TYPE(ANSWER_TYPE), G_DBUS_CALL_FLAGS_NONE,
+        remaining_ms(pending->asked->deadline), pending->cancellable, on_answer, pending);
+}
+
+static gboolean on_silence(void *pending) {
+    send_question(static_cast<pending_check *>(pending));
+    return G_SOURCE_CONTINUE;
+}
+
+// Runs in the context of the questions. At the deadline the calls end by themselves.
+static void await_answer(pending_check *pending) {
+    g_autoptr(GSource) silence = g_timeout_source_new(REPEAT_MS);
+    g_source_set_callback(silence, on_silence, pending, nullptr);
+    (void)g_source_attach(silence, client_context);  // Its number is not needed to destroy it.
+
+    send_question(pending);
+    while (pending->result == nullptr)
+        (void)g_main_context_iteration(client_context, TRUE);  // Whatever ran, the result decides.
+    g_source_destroy(silence);
+
+    if (pending->unanswered > 0)
+        g_cancellable_cancel(pending->cancellable);
+    while (pending->unanswered > 0)
+        (void)g_main_context_iteration(client_context, TRUE);
+}
+
+static bool ask_once(const question &asked, polkit_answer *out_answer, GError **error) {
+    g_autoptr(GCancellable) cancellable = g_cancellable_new();
+    pending_check pending = {&asked, cancellable, nullptr, 0};
     gboolean is_authorized = FALSE;
     gboolean needs_password = FALSE;
 
-    if (answer == nullptr) {
-        if (g_error_matches(cause, G_IO_ERROR, G_IO_ERROR_TIMED_OUT))
-            cancel_question(cancellation_id);
-        g_propagate_error(error, g_steal_pointer(&cause));
+    g_main_context_push_thread_default(client_context);
+    await_answer(&pending);
+    g_main_context_pop_thread_default(client_context);
+
+    g_autoptr(GAsyncResult) finished = pending.result;
+    g_autoptr(GVariant) answer = g_dbus_connection_call_finish(client_bus, finished, error);
+    if (answer == nullptr)
         return false;
-    }
     g_variant_get(answer, "((bb@a{ss}))", &is_authorized, &needs_password, nullptr);
     if (is_authorized)
         *out_answer = polkit_answer::ALLOWED;
@@ -212,4 +258,5 @@ bool polkit_client_check(const char *sender, const char *action_id, int deadline
 
 void polkit_client_release() {
     g_clear_object(&client_bus);
+    g_clear_pointer(&client_context, g_main_context_unref);
 }

@@ -19,6 +19,9 @@ from harness.world import Neighbour
 
 StartService = Callable[..., Service]
 
+# Of each daemon's log, its last characters.
+LOG_SHOWN = 8000
+
 
 def pytest_sessionstart() -> None:
     try:
@@ -37,7 +40,8 @@ def pytest_terminal_summary(terminalreporter: Any, exitstatus: int) -> None:
     for log in sorted(STATE.glob("*.log")):
         if text := log.read_text(errors="backslashreplace"):
             terminalreporter.section(log.name)
-            terminalreporter.write(text)
+            # A flood leaves some hundred thousand lines.
+            terminalreporter.write(text[-LOG_SHOWN:])
 
 
 @pytest.fixture(scope="session")

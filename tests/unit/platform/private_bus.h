@@ -33,7 +33,7 @@ class private_bus {
 //   test.undeclared    the error of the real polkit for an action that it does not know
 //   test.question      an error whose text shows the question as it came
 //   test.silent        nothing
-//   test.cancelled     yes when a question was cancelled before
+//   test.lost-answer   nothing the first time, then yes
 //   test.last-answer   yes, and exits
 //   test.last-question exits without an answer where it is a mortal one, else yes
 //

@@ -74,6 +74,13 @@ static bool work_with_lower_error(method_call &call, const char *user) {
     return pass_on(call, "Failed to look: ");
 }
 
+// Larger than a message of the bus may be.
+static bool work_with_huge_error(method_call &call, const char *) {
+    call.error = g_error_new_literal(g_quark_from_static_string("usermgmt"), 3,
+                                     std::string(std::size_t{32} << 20, 'x').c_str());
+    return false;
+}
+
 static bool work_without_lower_error(method_call &call, const char *) {
     return pass_on(call, "Failed to look: ");
 }
@@ -184,6 +191,16 @@ TEST_F(Frame, LowerErrorKeepsDomainAndCodeBehindThePrefix) {
     serve(method<"checkuser", work_with_lower_error>("handle-check-user"));
     EXPECT_EQ(check_user(), USERMGMT_ERROR_NAME "3: Failed to look: no user bob");
     EXPECT_EQ(log(), records_of_log{"16 Failed to look: no user bob"});
+}
+
+TEST_F(Frame, ErrorTextThatIsTooLargeIsReplaced) {
+    static constexpr const char *text =
+        "The reply of 33554440 bytes is larger than a bus message may be";
+    serve(method<"checkuser", work_with_huge_error>("handle-check-user"));
+    EXPECT_EQ(check_user(),
+              std::string("org.gtk.GDBus.UnmappedGError.Quark._g_2dfile_2derror_2dquark.Code24: ") +
+                  text);
+    EXPECT_EQ(log(), records_of_log{std::string("16 ") + text});
 }
 
 TEST_F(Frame, MissingLowerErrorIsUnknown) {
