@@ -45,8 +45,9 @@ struct question {
 struct pending_check {
     const question *asked;
     GCancellable *cancellable;
-    GAsyncResult *result;  // the first
     guint unanswered;
+    GVariant *answer;  // the first, or
+    GError *error;     // why there is none
 };
 
 static int remaining_ms(gint64 deadline) {
@@ -81,12 +82,20 @@ static GVariant *arguments_of(const question &asked) {
                          &details, NO_INTERACTION, "");
 }
 
+static bool has_ended(const pending_check &pending) {
+    return pending.answer != nullptr || pending.error != nullptr;
+}
+
 static void on_answer(GObject *, GAsyncResult *result, void *data) {
     auto *pending = static_cast<pending_check *>(data);
+    g_autoptr(GError) error = nullptr;
+    g_autoptr(GVariant) answer = g_dbus_connection_call_finish(client_bus, result, &error);
 
     pending->unanswered--;
-    if (pending->result == nullptr)
-        pending->result = G_ASYNC_RESULT(g_object_ref(result));
+    if (has_ended(*pending))
+        return;
+    pending->answer = g_steal_pointer(&answer);
+    pending->error = g_steal_pointer(&error);
 }
 
 // A sound answer is one of the right form; GDBus makes any other an error.
@@ -110,8 +119,8 @@ static void await_answer(pending_check *pending) {
     (void)g_source_attach(silence, client_context);  // Its number is not needed to destroy it.
 
     send_question(pending);
-    while (pending->result == nullptr)
-        (void)g_main_context_iteration(client_context, TRUE);  // Whatever ran, the result decides.
+    while (!has_ended(*pending))
+        (void)g_main_context_iteration(client_context, TRUE);  // Whatever ran, the answer decides.
     g_source_destroy(silence);
 
     if (pending->unanswered > 0)
@@ -122,7 +131,7 @@ static void await_answer(pending_check *pending) {
 
 static bool ask_once(const question &asked, polkit_answer *out_answer, GError **error) {
     g_autoptr(GCancellable) cancellable = g_cancellable_new();
-    pending_check pending = {&asked, cancellable, nullptr, 0};
+    pending_check pending = {&asked, cancellable, 0, nullptr, nullptr};
     gboolean is_authorized = FALSE;
     gboolean needs_password = FALSE;
 
@@ -130,10 +139,11 @@ static bool ask_once(const question &asked, polkit_answer *out_answer, GError **
     await_answer(&pending);
     g_main_context_pop_thread_default(client_context);
 
-    g_autoptr(GAsyncResult) finished = pending.result;
-    g_autoptr(GVariant) answer = g_dbus_connection_call_finish(client_bus, finished, error);
-    if (answer == nullptr)
+    g_autoptr(GVariant) answer = pending.answer;
+    if (answer == nullptr) {
+        g_propagate_error(error, pending.error);
         return false;
+    }
     g_variant_get(answer, "((bb@a{ss}))", &is_authorized, &needs_password, nullptr);
     if (is_authorized)
         *out_answer = polkit_answer::ALLOWED;

@@ -100,7 +100,7 @@ TEST_F(AuthzCheck, AsksForTheBusNameWithoutDetailsAndInteraction) {
 
     EXPECT_EQ(text_from_child([] { say(check(":1.4711", "test.question")); }),
               "0 authz 2 cannot check action test.question: "
-              "system-bus-name :1.4711, 0 details, flags 0, cancellable");
+              "system-bus-name :1.4711, 0 details, flags 0");
 }
 
 TEST_F(AuthzCheck, CallerWithoutUniqueNameIsRefusedUnasked) {

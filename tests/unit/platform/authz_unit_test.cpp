@@ -118,7 +118,7 @@ TEST_F(AuthzUnit, ParentIsToldTheActionAndTheUnit) {
             say(describe_outcome(result, error));
         });
     };
-    const std::string asked = "system-bus-name :1.4711, 2 details, flags 0, cancellable";
+    const std::string asked = "system-bus-name :1.4711, 2 details, flags 0";
 
     EXPECT_EQ(question("stopservice.sshd"), "0 authz 2 cannot check action " + PREFIX +
                                                 "stopservice.sshd: " + asked + ", action " +

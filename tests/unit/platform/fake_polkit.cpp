@@ -2,7 +2,6 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
-#include <cstring>
 #include <string>
 
 #include <fcntl.h>
