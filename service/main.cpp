@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <cstdlib>
 
+#include <sys/prctl.h>
 #include <unistd.h>
 
 #include <gio/gio.h>
@@ -16,6 +17,7 @@
 #include "service/quit_signals.h"
 #include "service/request.h"
 #include "service/service_state.h"
+#include "service/watchdog.h"
 #include "usermgmt/usermgmt.h"
 
 static constexpr const char *BUS_NAME = "com.zintor.PrivaneSystem";
@@ -88,6 +90,7 @@ static bool start(ServiceState *state, process_resources *resources, bool foregr
 
 // Until a quit signal.
 static void serve(ServiceState *state, GMainLoop *loop) {
+    watchdog_start();
     state->skeleton = privane_system__skeleton_new();
     connect_methods(state);
     state->owner_id = g_bus_own_name(G_BUS_TYPE_SYSTEM, BUS_NAME, G_BUS_NAME_OWNER_FLAGS_NONE,
@@ -104,6 +107,9 @@ static void close_database(ServiceState *state) {
 }
 
 int main(int argc, char **argv) {
+    // The memory holds passwords. A limit of 0 on core files does not hold for programs that take
+    // them from the kernel through a pipe.
+    (void)prctl(PR_SET_DUMPABLE, 0);  // fails for other values only
     // Inherited as ignored, every tool that the service runs would seem to succeed.
     (void)signal(SIGCHLD, SIG_DFL);
 

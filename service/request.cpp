@@ -3,11 +3,13 @@
 
 #include "platform/authz/authz.h"
 #include "service/reply.h"
+#include "service/watchdog.h"
 
 G_DEFINE_QUARK(privaneSystemError, privane_system_error)
 
 gboolean privane_check_auth(GDBusMethodInvocation *invocation, const char *action_id,
                             GError **error) {
+    watchdog_feed();
     const char *sender = g_dbus_method_invocation_get_sender(invocation);
     if (authz_check(sender, action_id, error) != 0)
         return TRUE;

@@ -1,20 +1,101 @@
-"""tests/bus/test_bus_policy.py: whom the bus lets own the service's name, and call it."""
-from harness.bus import ACCESS_DENIED, NAME, Bus, User, error_of
+"""tests/bus/test_bus_policy.py: whom the bus lets own the service's name, and send to it."""
+import time
+from pathlib import Path
+
+import pytest
+
+from conftest import StartService
+from harness.bus import ACCESS_DENIED, KINDS, NAME, Bus, User, domain_error, error_of
 from harness.fake_authz import FakeAuthz
-from harness.interface import METHODS
+from harness.interface import ACTION_PREFIX, METHODS
+from harness.polkit import hanging_polkitd
+from harness.sandbox import fake_library
 from harness.service import Service
+from harness.strace import Attached
+from harness.wire import Wire
 
 PRIMARY_OWNER = 1
 
+# A member that stands in a message of somebody, and in no other.
+FOREIGN, OWN = "TokenOfAStranger", "TokenOfAMember"
 
-def test_stranger_cannot_call_any_method(service: Service, stranger: User,
+every_kind = pytest.mark.parametrize("kind", KINDS)
+by_every_name = pytest.mark.parametrize("name", ["well-known", "unique"])
+
+
+def address(bus: Bus, name: str) -> str:
+    owner = bus.owner()
+    assert owner is not None
+    return owner if name == "unique" else NAME
+
+
+def received(service: Service, bus: Bus, folder: Path, send: User, *message: str) -> str:
+    """What the service reads while this is sent, up to a call of root's that it answers."""
+    trace = Attached(service.pid, folder / "trace", "recvmsg,recvfrom,read,readv")
+    with trace:
+        send.send_alone(*message)
+        assert bus.call("CheckUser", "s", "marker") == (False,)
+    text = "\n".join(trace.calls())
+    assert "CheckUser" in text
+    return text
+
+
+@by_every_name
+def test_stranger_cannot_call_any_method(name: str, service: Service, bus: Bus, stranger: User,
                                          authz: FakeAuthz) -> None:
     authz.forget()
 
     for method in METHODS:
-        error = error_of(stranger.call, method.member, method.signature, *method.arguments)
+        error = error_of(stranger.call, method.member, method.signature, *method.arguments,
+                         destination=address(bus, name))
         assert error.name == ACCESS_DENIED, method.member
     assert authz.calls() == []
+
+
+@every_kind
+@by_every_name
+def test_nothing_of_a_stranger_reaches_the_service(kind: str, name: str, service: Service, bus: Bus,
+                                                   stranger: User, tmp_path: Path) -> None:
+    assert FOREIGN not in received(service, bus, tmp_path, stranger, kind, address(bus, name),
+                                   FOREIGN)
+    assert len(service.output()) == 3  # as when it had started
+
+
+@pytest.mark.parametrize("kind", ["call", "signal"])
+@by_every_name
+def test_what_a_member_of_the_group_sends_does(kind: str, name: str, service: Service, bus: Bus,
+                                               clerk: User, tmp_path: Path) -> None:
+    assert OWN in received(service, bus, tmp_path, clerk, kind, address(bus, name), OWN)
+
+
+@pytest.mark.parametrize("kind", ["reply", "error"])
+def test_answer_that_nobody_asked_for_reaches_the_service_from_no_member(
+        kind: str, service: Service, bus: Bus, clerk: User, tmp_path: Path) -> None:
+    assert OWN not in received(service, bus, tmp_path, clerk, kind, address(bus, "unique"), OWN)
+
+
+# GDBus takes a reply by its number alone, whoever sent it.
+@pytest.mark.parametrize("liar", ["stranger", "clerk"])
+def test_forged_answer_of_polkit_allows_nothing(liar: str, start: StartService, bus: Bus,
+                                                request: pytest.FixtureRequest) -> None:
+    user: User = request.getfixturevalue(liar)
+    library = fake_library("authz_short_deadline/libauthz.so.1")
+    service = start(environment={"LD_LIBRARY_PATH": str(library.parent)})
+    service.wait_registered(bus)
+    assert bus.call("CheckUser", "s", "root") == (True,)  # Then it asks polkit one question a call.
+    wire = Wire()
+
+    with hanging_polkitd():
+        asked = wire.send("CheckUser", "s", "root")
+        for _ in range(5):
+            user.send_alone("reply", address(bus, "unique"), "Allowed", range(1, 200))
+            time.sleep(0.03)
+        answer = wire.until_reply(asked)[-1].answer()
+    wire.close()
+
+    assert answer == domain_error("authz", 4, "Authorization check failed: cannot check action "
+                                              f"{ACTION_PREFIX}checkuser: no answer in time")
+    assert service.stop() == 0
 
 
 def test_member_of_the_group_can_call(service: Service, clerk: User) -> None:

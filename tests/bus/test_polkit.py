@@ -1,23 +1,25 @@
 """tests/bus/test_polkit.py: the real polkitd decides, by our policy and rules."""
-import os
-import signal
 import time
 
 import pytest
 
+from conftest import StartService
 from harness.accounts import CLERK_UID
 from harness.bus import Bus, BusError, User, domain_error, error_of
+from harness.deadline import wait_for
 from harness.interface import (ACTION_PREFIX, DECLARED_ACTIONS, METHODS, QUERIES,
                                UNIT_ACTIONS, Method)
-from harness.polkit import ExampleRules, actions, check
-from harness.sandbox import polkitd_pid
+from harness.polkit import ExampleRules, actions, check, hanging_polkitd
+from harness.sandbox import fake_library
 from harness.service import Service
 
 # The answers of EnumerateActions: not authorized for any session, nor for an active one.
 REFUSED_TO_ALL = (0, 0, 0)
 
 AUTHZ_REFUSED, AUTHZ_TIMED_OUT = 1, 4
-CHECK_DEADLINE = 20
+# By default; and of the library that has a short one.
+CHECK_DEADLINE = 25
+SHORT_DEADLINE = 0.3
 
 VIEWER_ACTIONS = {ACTION_PREFIX + name for name in (
     "checkuser", "checkgroup", "getuser", "getuserlist", "getgroup", "getgrouplist",
@@ -134,19 +136,49 @@ def test_rules_that_go_take_their_grants_along(real_service: Service, viewer: Us
         ACTION_PREFIX + "checkuser", viewer.uid)
 
 
+def silence(action: str) -> BusError:
+    return domain_error("authz", AUTHZ_TIMED_OUT, "Authorization check failed: cannot check action "
+                                                  f"{ACTION_PREFIX}{action}: no answer in time")
+
+
 @pytest.mark.slow
 def test_hanging_polkitd_costs_one_call_its_deadline(real_service: Service, bus: Bus) -> None:
     assert bus.call("CheckUser", "s", "root") == (True,)
     begin = time.monotonic()
 
-    os.kill(polkitd_pid(), signal.SIGSTOP)
-    try:
+    with hanging_polkitd():
         error = error_of(bus.call, "CheckUser", "s", "root", timeout=CHECK_DEADLINE + 10)
-    finally:
-        os.kill(polkitd_pid(), signal.SIGCONT)
 
     assert CHECK_DEADLINE - 1 < time.monotonic() - begin < CHECK_DEADLINE + 5
-    assert error == domain_error(
-        "authz", AUTHZ_TIMED_OUT, "Authorization check failed: cannot check action "
-                                  f"{ACTION_PREFIX}checkuser: no answer in time")
+    assert error == silence("checkuser")
     assert bus.call("CheckUser", "s", "root") == (True,)
+
+
+@pytest.mark.parametrize("is_known", [True, False], ids=["asked before", "never asked"])
+@pytest.mark.parametrize("member, action", [("CheckUser", "checkuser"),
+                                            ("StartService", "startservice.lensd")])
+def test_call_is_refused_after_the_deadline_of_the_build(
+        member: str, action: str, is_known: bool, start: StartService, bus: Bus) -> None:
+    library = fake_library("authz_short_deadline/libauthz.so.1")
+    service = start(environment={"LD_LIBRARY_PATH": str(library.parent)})
+    service.wait_registered(bus)
+    word = "lensd" if member == "StartService" else "root"
+    if is_known:
+        assert bus.call("CheckUser", "s", "root") == (True,)
+    before = service.output()
+    begin = time.monotonic()
+
+    with hanging_polkitd():
+        error = error_of(bus.call, member, "s", word)
+        taken = time.monotonic() - begin
+
+    assert error == silence(action)
+    assert service.output() == before + [f"warning: {error.text}"]
+    assert SHORT_DEADLINE <= taken < SHORT_DEADLINE + 2
+    wait_for("polkitd", lambda: is_answered(bus))
+    assert bus.call("CheckUser", "s", "root") == (True,)
+    assert service.stop() == 0
+
+
+def is_answered(bus: Bus) -> bool:
+    return check(bus, bus.unique_name, ACTION_PREFIX + "checkuser")

@@ -1,7 +1,8 @@
 """tests/device/test_readers.py: the link, the readers and the starters, on the real thing."""
 import time
 
-from calls import ask
+import pytest
+from calls import BusError, ask
 from camera.machine import Camera
 
 SIGNALS = "/run/account-watcher/signals"
@@ -29,10 +30,20 @@ def test_the_kernels_slabs(camera: Camera) -> None:
 
 
 def test_a_file_is_read_as_it_is(camera: Camera) -> None:
-    camera.put_file("/root/log", "one\ntwo\n\nlast ä".encode(), 0o600)
-    assert ask(camera, "ReadLogFile", "/root/log") == ("one\ntwo\n\nlast ä",)
+    for path in ("/var/log/keys.log", "/tmp/log", "/var/tmp/log", "/run/log.txt"):
+        camera.put_file(path, "one\ntwo\n\nlast ä".encode(), 0o600)
+        assert ask(camera, "ReadLogFile", path) == ("one\ntwo\n\nlast ä",)
     assert ask(camera, "ReadLogFile", "/etc/passwd") \
         == (camera.read_file("/etc/passwd").decode(),)
+
+
+def test_peoples_homes_are_closed(camera: Camera) -> None:
+    for path in ("/root/key", "/home/key", "/run/user/key"):
+        camera.run(["mkdir", "-p", path.rpartition("/")[0]]).check()
+        camera.put_file(path, b"key", 0o644)
+        with pytest.raises(BusError) as caught:
+            ask(camera, "ReadLogFile", path)
+        assert caught.value.name.endswith("_g_2dfile_2derror_2dquark.Code4")
 
 
 def test_pinsrv_runs_with_the_callers_arguments(camera: Camera) -> None:

@@ -14,6 +14,10 @@ NAME = "com.zintor.PrivaneSystem"
 PATH = "/com/zintor/PrivaneSystem"
 INTERFACE = "com.zintor.PrivaneSystem"
 
+# What send_alone() sends.
+KINDS = {"call": Gio.DBusMessageType.METHOD_CALL, "signal": Gio.DBusMessageType.SIGNAL,
+         "reply": Gio.DBusMessageType.METHOD_RETURN, "error": Gio.DBusMessageType.ERROR}
+
 # Longer than anything takes that does not wait for a deadline of its own.
 CALL_TIMEOUT = 10.0
 
@@ -74,10 +78,28 @@ class Bus:
         return body.unpack() if body else ()
 
     def call(self, member: str, signature: str = "", *arguments: Any,
-             timeout: float = CALL_TIMEOUT) -> Any:
+             timeout: float = CALL_TIMEOUT, destination: str = NAME) -> Any:
         """Calls a method of the service; signature is that of its arguments, bare."""
-        return self.send(NAME, PATH, INTERFACE, member,
+        return self.send(destination, PATH, INTERFACE, member,
                          GLib.Variant(f"({signature})", arguments), timeout)
+
+    def send_alone(self, kind: str, destination: str, member: str,
+                   serials: Sequence[int] = (1,)) -> None:
+        """Sends messages to which no answer is expected, one for each number of a message that a
+        reply pretends to answer, and waits until the bus has dealt with them. A reply says that
+        polkit allows something."""
+        for serial in serials:
+            message = Gio.DBusMessage.new_signal(PATH, INTERFACE, member)
+            message.set_message_type(KINDS[kind])
+            message.set_flags(Gio.DBusMessageFlags.NO_REPLY_EXPECTED)
+            message.set_destination(destination)
+            if kind in ("reply", "error"):
+                message.set_reply_serial(serial)
+                message.set_body(GLib.Variant("((bba{ss}))", ((True, False, {}),)))
+            if kind == "error":
+                message.set_error_name(f"{INTERFACE}.Error")
+            self.connection.send_message(message, Gio.DBusSendMessageFlags.NONE)
+        self.ask_bus("GetId")
 
     def ask_bus(self, member: str, signature: str = "", *arguments: Any) -> Any:
         return self.send("org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus",
@@ -121,10 +143,17 @@ class User:
         return answer["reply"]
 
     def call(self, member: str, signature: str = "", *arguments: Any,
-             timeout: float = CALL_TIMEOUT) -> Any:
+             timeout: float = CALL_TIMEOUT, destination: str = NAME) -> Any:
         reply = self._exchange({"ask": "call", "member": member, "signature": signature,
-                                "arguments": arguments, "timeout": timeout})
+                                "arguments": arguments, "timeout": timeout,
+                                "destination": destination})
         return tuple(reply)
+
+    def send_alone(self, kind: str, destination: str, member: str,
+                   serials: Sequence[int] = (1,)) -> None:
+        """As Bus.send_alone()."""
+        self._exchange({"ask": "send", "kind": kind, "destination": destination,
+                        "member": member, "serials": list(serials)})
 
     def request_name(self, name: str) -> int:
         """The bus's answer: 1 is primary owner."""

@@ -1,5 +1,7 @@
 """tests/bus/harness/polkit.py: rules, declarations and questions for the sandbox's polkitd."""
 import itertools
+import os
+import signal
 from contextlib import contextmanager
 from pathlib import Path
 from typing import Any, Iterator, Mapping
@@ -9,6 +11,7 @@ from gi.repository import GLib
 from harness.bus import Bus, User
 from harness.deadline import wait_for
 from harness.interface import ACTION_PREFIX
+from harness.sandbox import polkitd_pid
 
 AUTHORITY = ("org.freedesktop.PolicyKit1", "/org/freedesktop/PolicyKit1/Authority",
              "org.freedesktop.PolicyKit1.Authority")
@@ -33,6 +36,16 @@ def actions(bus: Bus) -> dict[str, tuple[int, int, int]]:
     """The declared actions, each with the answers for any, inactive and active sessions."""
     reply: Any = bus.send(*AUTHORITY, "EnumerateActions", GLib.Variant("(s)", ("C",)))
     return {row[0]: (row[6], row[7], row[8]) for row in reply[0]}
+
+
+@contextmanager
+def hanging_polkitd() -> Iterator[None]:
+    """polkitd is there, and answers nobody."""
+    os.kill(polkitd_pid(), signal.SIGSTOP)
+    try:
+        yield
+    finally:
+        os.kill(polkitd_pid(), signal.SIGCONT)
 
 
 def install(path: Path, text: str) -> None:

@@ -14,8 +14,11 @@ def answer(bus: Bus, request: dict[str, Any]) -> Any:
         return bus.unique_name
     if request["ask"] == "own":
         return bus.ask_bus("RequestName", "su", request["name"], 0)[0]
+    if request["ask"] == "send":
+        return bus.send_alone(request["kind"], request["destination"], request["member"],
+                              request["serials"])
     return bus.call(request["member"], request["signature"], *request["arguments"],
-                    timeout=request["timeout"])
+                    timeout=request["timeout"], destination=request["destination"])
 
 
 def main() -> None:

@@ -157,6 +157,14 @@ TEST_F(AuthzUnit, OneDeadlineHoldsForBothQuestions) {
     EXPECT_LT(g_get_monotonic_time() - start, 5 * G_USEC_PER_SEC);
 }
 
+TEST_F(AuthzUnit, ParentHasOnlyWhatIsLeftOfTheDeadline) {
+    const gint64 start = g_get_monotonic_time();
+
+    EXPECT_EQ(check_within(1500, "startservice.slow"),
+              "0 authz 4 cannot check action " + PREFIX + "startservice.slow: no answer in time");
+    EXPECT_LT(g_get_monotonic_time() - start, 2300 * 1000);
+}
+
 TEST_F(AuthzUnit, FrozenPolkitAsksNoParent) {
     polkit_.freeze();
 

@@ -254,10 +254,17 @@ class Unit(unittest.TestCase):
         self.assertEqual(self.value_of("Restart"), ["always"])
         self.assertEqual(self.value_of("KillMode"), ["process"])
 
-    def test_nothing_that_breaks_a_method_is_set(self):
-        for key in ("PrivateDevices", "PrivateNetwork", "PrivateTmp", "PrivateUsers", "ProtectClock",
-                    "ProtectHome", "ProtectProc", "ProcSubset", "UMask", "User"):
+    def test_nothing_that_breaks_a_method_is_set_and_the_unit_says_why(self):
+        comments = "\n".join(line for line in self.text.splitlines() if line.startswith("#"))
+        for key in ("MemoryMax", "PrivateDevices", "PrivateNetwork", "PrivateTmp", "PrivateUsers",
+                    "ProcSubset", "ProtectClock", "RestrictFileSystems", "RootDirectory", "TasksMax",
+                    "UMask", "User"):
             self.assertEqual(self.value_of(key), [], key)
+            self.assertIn(key, comments)
+
+    def test_leaves_no_image_of_its_memory(self):
+        self.assertEqual(self.value_of("LimitCORE"), ["0"])
+        self.assertEqual(self.value_of("WatchdogSignal"), ["SIGKILL"])
 
 
 if __name__ == "__main__":

@@ -2,6 +2,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
+#include <cstring>
 #include <string>
 
 #include <fcntl.h>
@@ -82,6 +83,11 @@ static void answer_undeclared(GDBusMethodInvocation *call, const std::string &ac
     answer_with_error(call, "Action " + action + " is not registered");
 }
 
+static void answer_late(GDBusMethodInvocation *call, const std::string &action) {
+    g_usleep(1200 * 1000);
+    answer_undeclared(call, action);
+}
+
 // Yes, no, or only with a password, as the word says; false for another word.
 static bool answer_word(GDBusMethodInvocation *call, const std::string &word) {
     if (word != "allowed" && word != "refused" && word != "password")
@@ -99,7 +105,7 @@ static void on_parent(GVariant *question, GDBusMethodInvocation *call) {
     (void)g_variant_lookup(details, "unit", "&s", &unit);
 
     const std::string name = unit;
-    if (!answer_word(call, name) && name != "silent")
+    if (!answer_word(call, name) && name != "silent" && name != "slow")
         answer_with_error(call, describe(question) + ", action " + action + ", unit " + unit);
 }
 
@@ -113,6 +119,8 @@ static void on_unit_question(const std::string &action, GVariant *question,
         on_parent(question, call);
     else if (unit == "broken")
         answer_with_error(call, "Action " + action + " is broken");
+    else if (unit == "slow")
+        answer_late(call, action);
     else if (unit.rfind("declared-", 0) != 0 ||
              !answer_word(call, unit.substr(std::strlen("declared-"))))
         answer_undeclared(call, action);

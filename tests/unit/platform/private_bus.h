@@ -41,10 +41,11 @@ class private_bus {
 //
 //   ACTION.declared-WORD  the word: allowed, refused or password
 //   ACTION.broken         an error of another text than an action has that is not known
+//   ACTION.slow           after 1.2 s, the error for an action that is not known
 //   ACTION.OTHER          the error for an action that is not known
 //   setdefaulttarget      likewise
-//   ACTION                by the detail "unit": one of the words, nothing for silent, else an error
-//                         whose text shows the question as it came
+//   ACTION                by the detail "unit": one of the words, nothing for silent and slow, else
+//                         an error whose text shows the question as it came
 class fake_polkit {
   public:
     enum class end { MORTAL, IMMORTAL };

@@ -1,0 +1,82 @@
+"""tests/device/test_hardening.py: what the unit takes from the service, and that nothing misses it."""
+import re
+
+import pytest
+from calls import ask
+from camera import system_tour
+from camera.machine import Camera
+from camera.tour import METHODS, NAME, UNIT, Tour, call
+from camera.transcript import Transcript
+from drop_in import install_drop_in, unit_properties
+
+MOST_EXPOSURE = 3.5
+
+# A call that the filter refuses ends the program, and is told in the kernel's log. The one exception
+# is GLib's, which tries to set its threads' priorities and does without.
+STRICT = "[Service]\nSystemCallErrorNumber=kill\nSystemCallFilter=sched_setattr\n"
+
+# What the kernel says of a call that the filter of system calls, an access control or an audit rule
+# refused, and of a process that came to an end by it.
+DENIALS = r"type=1326|type=14\d\d|apparmor=\"DENIED\"|denied|segfault|traps:"
+
+RECORDING_SYSFLASH = b"#!/bin/sh\necho $2 >>/var/lib/sysflash/resets\n"
+
+
+@pytest.fixture
+def strict(camera: Camera) -> Camera:
+    """A camera whose service may not even try."""
+    install_drop_in(camera, "strict.conf", STRICT)
+    return camera
+
+
+def denials(camera: Camera) -> list[str]:
+    camera.run("journalctl --sync").check()
+    shown = camera.run("journalctl --no-pager -o cat _TRANSPORT=kernel + _TRANSPORT=audit").check()
+    lines = shown.out.splitlines()
+    assert any("Linux version" in line for line in lines)
+    return [line for line in lines if re.search(DENIALS, line)]
+
+
+def test_exposure(camera: Camera) -> None:
+    shown = camera.run(["systemd-analyze", "security", "--no-pager", UNIT]).check().out
+    match = re.search(rf"Overall exposure level for {UNIT}: (\d+\.\d+) ", shown)
+    assert match, shown[-200:]
+    assert float(match[1]) <= MOST_EXPOSURE
+
+
+def reset_without_a_reboot(show: Transcript) -> None:
+    """The kernel's log would be lost with one, and the reboot itself is systemd's work."""
+    show.camera.put_file("/usr/sbin/sysflash", RECORDING_SYSFLASH, 0o755)
+    show.step(call("UpdateReleaseFile", "SOFT_RESET"), shows=["()\n"], says="")
+    show.step(call("Reboot"), shows=["(0,)\n"], says="")
+    show.step(["cat", "/var/lib/sysflash/resets"], shows=["soft\n"], says="")
+
+
+def test_all_methods_do_their_work_and_try_nothing_that_is_denied(
+        strict: Camera, monkeypatch: pytest.MonkeyPatch) -> None:
+    monkeypatch.setattr(system_tour, "_show_reboot", reset_without_a_reboot)
+    lines: list[str] = []
+    Tour(strict, lines.append, bold=False).walk()
+    called = set(re.findall(rf"-m {re.escape(NAME)}\.(\w+)", "".join(lines)))
+    assert len(called) == METHODS
+    assert "strict.conf" in unit_properties(strict, "DropInPaths")["DropInPaths"]
+    assert denials(strict) == []
+
+
+@pytest.mark.parametrize("attempt", [
+    "perl -e 'syscall(141, 0, 0, 0)'",  # setpriority
+    "perl -e 'syscall(165, 0, 0, 0, 0, 0)'",  # mount
+    "perl -e 'syscall(105, 1)'",  # setuid
+])
+def test_a_denial_is_seen(strict: Camera, attempt: str) -> None:
+    strict.put_file("/usr/sbin/sysflash", f"#!/bin/sh\n{attempt}\n".encode(), 0o755)
+    assert denials(strict) == []
+    ask(strict, "Reboot")
+    assert [line for line in denials(strict) if 'comm="perl"' in line and "type=1326" in line]
+
+
+def test_a_tool_that_is_denied_a_call_is_told_so(camera: Camera) -> None:
+    camera.put_file("/usr/sbin/sysflash", b"#!/bin/sh\n"
+                    b"exec perl -e 'syscall(105, 1) < 0 or exit 9; exit $!+0'\n", 0o755)
+    eperm = 1
+    assert ask(camera, "Reboot") == (eperm << 8,)
