@@ -21,4 +21,18 @@ class Defect:
     noticed_by: Start
 
 
-DEFECTS: tuple[Defect, ...] = ()
+KILLS = Start("kill_points", 4_000)
+FAILING = Start("failing_calls", 1_500)
+
+DEFECTS = (
+    Defect("no-file-fsync.patch",
+           Start("power_cuts", 300, ("--file-system", "ext4-writeback"))),
+    Defect("no-directory-fsync.patch", KILLS),
+    Defect("rename-before-fsync.patch", KILLS),
+    Defect("temporary-file-readable.patch", KILLS),
+    Defect("last-wins-shadow-index.patch", KILLS),
+    Defect("ignored-read-error.patch", FAILING),
+    Defect("missing-utf8-check.patch", Start("fuzzing", 5, ("--target", "tool_arguments"))),
+    Defect("forgotten-authorization.patch",
+           Start("authorization_matrix", 368, ("-k", "test_refused"))),
+)
