@@ -59,7 +59,8 @@ static void join_lines(std::string_view text, found_line *line, wiped_text *join
                                              ? find_continuation(joined->view())
                                              : std::string_view::npos;
         line->takes_next = continuation != std::string_view::npos;
-        if (line->takes_next && end != std::string_view::npos)
+        // The last line may lack its end, which it gets when the file is written.
+        if (line->takes_next)
             joined->truncate(continuation);
     } while (line->takes_next && line->length < text.size());
 }

@@ -42,6 +42,8 @@ TEST(DigestLines, EveryFormOfAUsersLineIsOne) {
         "al\\\r\nice:PRI\\\n\\\nVANE:" + HASH + "\n",
         "\\\n" + ALICE + "\n",
         ALICE + "\\\n",
+        // It is one as soon as it has the end that the next change gives it.
+        "alice:PRIVANE\\",
         ALICE + "\\\n# this line is a part of it\n",
         "alice:PRIVANE\0 hidden\\\n"s,
         // The second backslash is found when the empty line has been put behind the first.
