@@ -196,7 +196,9 @@ static bool is_served(const intake *self, GDBusMessage *call) {
     if (method == nullptr)
         return false;
     std::string wanted;
-    for (GDBusArgInfo **argument = method->in_args; *argument != nullptr; argument++)
+    // A method without arguments has no list of them.
+    for (GDBusArgInfo **argument = method->in_args; argument != nullptr && *argument != nullptr;
+         argument++)
         wanted += (*argument)->signature;
     return wanted == g_dbus_message_get_signature(call);
 }

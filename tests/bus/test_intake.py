@@ -9,6 +9,8 @@ from gi.repository import Gio, GLib
 from harness.bus import INTERFACE, NAME, PATH, Bus, BusError, domain_error, error_of
 from harness.deadline import wait_for
 from harness.device import LLDPCLI, Device
+from harness.fake_authz import FakeAuthz
+from harness.interface import ACTION_PREFIX, QUERIES
 from harness.service import Service
 from harness.stage import Stage
 from harness.wire import Wire
@@ -130,6 +132,20 @@ def test_who_wants_no_answer_gets_none(service: Service, wires: Callable[[int], 
     _, serial = bus.connection.send_message(message, Gio.DBusSendMessageFlags.NONE)
     assert bus.call("CheckUser", "s", "root") == (True,)
     assert serial not in heard and heard
+
+
+@pytest.mark.parametrize("member", [method.member for method in QUERIES])
+def test_who_wants_no_answer_is_served(member: str, service: Service, authz: FakeAuthz,
+                                       bus: Bus) -> None:
+    (method,) = (row for row in QUERIES if row.member == member)
+    message = Gio.DBusMessage.new_method_call(NAME, PATH, INTERFACE, member)
+    message.set_flags(Gio.DBusMessageFlags.NO_REPLY_EXPECTED)
+    if method.signature:
+        message.set_body(GLib.Variant(f"({method.signature})", method.arguments))
+    bus.connection.send_message(message, Gio.DBusSendMessageFlags.NONE)
+    assert bus.call("CheckUser", "s", "root") == (True,)
+    assert [check.action for check in authz.checks()][-2:] == [
+        method.action_id, ACTION_PREFIX + "checkuser"]
 
 
 def test_a_call_that_carries_descriptors_is_refused(service: Service, bus: Bus) -> None:
