@@ -145,13 +145,14 @@ class Fuzzing:
         """Of a service that ended, the sanitizers tell more than the bus."""
         if answer.error and answer.error.name == NO_REPLY:
             wait_for("the service's end", lambda: not self.stage.service.is_running())
-            self._sanitized.require_no_report()
+            self._require_alive(call)
         raise AssertionError(f"{call}\nwas answered with {answer}")
 
     def _require_alive(self, call: Call) -> None:
         if not self.stage.service.is_running():
             self._sanitized.require_no_report()
-            raise AssertionError(f"ended after {call}: {self.stage.service.output()[-5:]}")
+            output = "\n".join(self.stage.service.output()[-60:])
+            raise AssertionError(f"ended with {self.stage.service.status} after {call}:\n{output}")
 
     def _look(self) -> None:
         if self._watch.changed_root():

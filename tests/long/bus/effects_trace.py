@@ -44,11 +44,14 @@ class EffectsTrace(Attached):
         """What was begun up to now."""
         os.kill(self._service, MARK)
         wait_for("the mark in the trace", self._is_marked)
-        with self._output.open() as trace:
+        with self._output.open("rb") as trace:
             trace.seek(self._read)
-            lines = trace.read().splitlines()
-            self._read = trace.tell()
-        calls = [re.sub(r" +", " ", line.split(maxsplit=1)[1]) for line in lines]
+            lines = trace.read().splitlines(keepends=True)
+        if not lines[-1].endswith(b"\n"):  # strace is still at it
+            lines.pop()
+        self._read += sum(map(len, lines))
+        calls = [re.sub(r" +", " ", line.split(maxsplit=1)[1])
+                 for line in b"".join(lines).decode(errors="backslashreplace").splitlines()]
         self.calls_seen += len(calls)
         return calls
 
