@@ -3,8 +3,8 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdint>
 #include <cstdio>
-#include <cstdlib>
 #include <cstring>
 #include <ctime>
 #include <string_view>
@@ -12,9 +12,11 @@
 #include <fcntl.h>
 #include <sys/file.h>
 #include <unistd.h>
+#include <zlib.h>
 
-// What stands before the parameters in each copy: a CRC and, where there are two, a counter.
-static constexpr std::size_t COPY_HEADER = 5;
+// What stands before the parameters in each copy: their CRC and, where there are two, a counter.
+static constexpr std::size_t CRC_SIZE = 4;
+static constexpr std::size_t COPY_HEADER = CRC_SIZE + 1;
 
 // U-Boot's list of flags, of which libubootenv makes a parameter only when it writes.
 static constexpr std::string_view FLAGS = ".flags=";
@@ -77,6 +79,46 @@ std::size_t boot_copies::capacity() const {
     return copies_[0].size - COPY_HEADER;
 }
 
+boot_copies::copy_bytes boot_copies::read_copy(const copy &one) {
+    copy_bytes bytes(static_cast<char *>(std::malloc(one.size)));
+    if (bytes == nullptr)
+        return nullptr;
+
+    const off_t start = one.offset < 0 ? lseek(one.fd, 0, SEEK_END) + one.offset : one.offset;
+    if (pread(one.fd, bytes.get(), one.size, start) == static_cast<ssize_t>(one.size))
+        return bytes;
+    errno = EIO;  // as libubootenv has it, whatever the cause
+    return nullptr;
+}
+
+// The CRC is in the machine's byte order, and is of as much as zlib's type for lengths can tell,
+// for libubootenv, too.
+static bool is_valid(const char *crc, std::string_view parameters) {
+    std::uint32_t expected = 0;
+    std::memcpy(&expected, crc, sizeof expected);
+    return expected == crc32(0, reinterpret_cast<const Bytef *>(parameters.data()),
+                             static_cast<uInt>(parameters.size()));
+}
+
+// An empty string stands behind the last parameter, or where the first would.
+static bool has_end(std::string_view parameters) {
+    return parameters.front() == '\0' ||
+           parameters.find(std::string_view("\0\0", 2)) != std::string_view::npos;
+}
+
+int boot_copies::check_ends() const {
+    const std::size_t header = count_ == 1 ? CRC_SIZE : COPY_HEADER;
+    for (int i = 0; i < count_; i++) {
+        const copy_bytes bytes = read_copy(copies_[i]);
+        if (bytes == nullptr)
+            return -errno;
+        const std::string_view parameters(bytes.get() + header, copies_[i].size - header);
+        if (!has_end(parameters) && is_valid(bytes.get(), parameters))
+            return -EBADMSG;
+    }
+    return 0;
+}
+
 // The list ends with a NUL, as does what stands before it.
 static std::size_t flags_in(std::string_view text) {
     std::size_t longest = 0;
@@ -92,13 +134,9 @@ static std::size_t flags_in(std::string_view text) {
 std::size_t boot_copies::flags_length() const {
     std::size_t longest = 0;
     for (int i = 0; i < count_; i++) {
-        const copy &one = copies_[i];
-        auto *text = static_cast<char *>(std::malloc(one.size));
-        const off_t start = one.offset < 0 ? lseek(one.fd, 0, SEEK_END) + one.offset : one.offset;
-        const ssize_t length = text != nullptr ? pread(one.fd, text, one.size, start) : -1;
-        if (length > 0)
-            longest = std::max(longest, flags_in({text, static_cast<std::size_t>(length)}));
-        std::free(text);
+        const copy_bytes bytes = read_copy(copies_[i]);
+        if (bytes != nullptr)
+            longest = std::max(longest, flags_in({bytes.get(), copies_[i].size}));
     }
     return longest;
 }

@@ -3,6 +3,8 @@
 #pragma once
 
 #include <cstddef>
+#include <cstdlib>
+#include <memory>
 
 #include <sys/types.h>
 
@@ -20,6 +22,10 @@ class boot_copies {
 
     // Opens their devices. Before a write, so that sync learns of all that failed since.
     int open();
+
+    // -EBADMSG where a copy that is valid has no end to its parameters: libubootenv would read on
+    // behind it. -EIO where a copy cannot be read whole. The copies are open.
+    int check_ends() const;
 
     // What of a copy is left for parameters.
     std::size_t capacity() const;
@@ -41,7 +47,14 @@ class boot_copies {
         int fd;
     };
 
+    struct from_malloc {
+        void operator()(char *bytes) const { std::free(bytes); }
+    };
+    using copy_bytes = std::unique_ptr<char, from_malloc>;
+
     bool read_line(const char *line);
+    // All bytes of the copy; null, and errno, where there are fewer.
+    static copy_bytes read_copy(const copy &one);
 
     copy copies_[MAX_COPIES] = {};
     int count_ = 0;

@@ -57,7 +57,11 @@ class environment {
 
     // -ENODATA when no copy is valid; the environment is then empty.
     int open() {
-        const int result = await_boot_lock();
+        int result = await_boot_lock();
+        if (result == 0)
+            result = copies_.open();
+        if (result == 0)
+            result = copies_.check_ends();
         return result == 0 ? libuboot_open(ctx_) : result;
     }
 
@@ -65,13 +69,11 @@ class environment {
     int set(const char *name, const char *value) { return libuboot_set_env(ctx_, name, value); }
 
     int store() {
-        int result = copies_.open();
         // libubootenv takes a list whose empty string behind the last parameter does not fit any
         // more, and then cannot read it; and it writes a list of flags beyond the end.
-        if (result == 0 && length() + copies_.flags_length() + 1 > copies_.capacity())
-            result = -ENOSPC;
-        if (result == 0)
-            result = libuboot_env_store(ctx_);
+        if (length() + copies_.flags_length() + 1 > copies_.capacity())
+            return -ENOSPC;
+        const int result = libuboot_env_store(ctx_);
         return result == 0 ? copies_.sync() : result;
     }
 

@@ -24,7 +24,9 @@ extern "C" {
 enum bootparam_result {
     BOOTPARAM_OK = 0,
     BOOTPARAM_FAILED = -1,  /* the boot block cannot be read or written, or is full: ENOSPC; its
-                               description cannot be read, or is none: EINVAL */
+                               description cannot be read, or is none: EINVAL; a copy has a
+                               right CRC, but no end to its parameters: EBADMSG, until that copy is
+                               erased or replaced by other means */
     BOOTPARAM_INVALID = -2, /* a name, value, unit or chip that no boot block takes */
     BOOTPARAM_BLANK = -982, /* no copy of the environment is valid: nothing was written yet, or all
                                is broken; the next write begins anew, with its one parameter */

@@ -30,7 +30,7 @@ struct images {
     bool operator==(const images &other) const = default;
 };
 
-// The outcome of a read: the value behind a "=", or the result.
+// The outcome of a read: the value behind a "=", or the result and the cause.
 using outcomes = std::map<std::string, std::string>;
 
 // As zlib has it.
@@ -46,19 +46,25 @@ static std::uint32_t crc32_of(std::string_view bytes) {
 
 // A copy begins with the CRC of its parameters, in the machine's byte order; a flag stands between
 // them where there are two.
-static std::string image_of(const std::string &part, std::size_t size, bool has_flag,
-                            bool is_valid) {
+static std::string image_of(const std::string &part, std::size_t size, bool has_flag, bool is_valid,
+                            char filler) {
     std::string body = part.substr(0, size - CRC_SIZE);
-    body.resize(size - CRC_SIZE, '\0');
-    // libubootenv reads on behind a valid copy whose parameters have no end; nothing writes such a
-    // one.
-    if (is_valid)
-        body.replace(body.size() - 2, 2, 2, '\0');
+    body.resize(size - CRC_SIZE, filler);
     const std::uint32_t crc =
         is_valid ? crc32_of(std::string_view(body).substr(has_flag ? 1 : 0)) : 0x11223344;
     std::string image(CRC_SIZE, '\0');
     std::memcpy(image.data(), &crc, CRC_SIZE);
     return image + body;
+}
+
+// Whether the empty string that ends the parameters is missing.
+static bool is_endless(const std::string &image, bool has_flag) {
+    std::size_t at = CRC_SIZE + (has_flag ? 1 : 0);
+    while (at < image.size() && image[at] != '\0') {
+        at = image.find('\0', at);
+        at = at == std::string::npos ? image.size() : at + 1;
+    }
+    return at >= image.size();
 }
 
 static void lay(const images &laid, std::size_t size, bool has_two) {
@@ -84,6 +90,12 @@ static void check_failure(int result, int error, int number) {
          std::to_string(error) + " " + std::to_string(number));
 }
 
+static std::string failed(int result, int error) {
+    return std::to_string(result) + " " + std::to_string(error);
+}
+
+static const std::string REFUSED = failed(BOOTPARAM_FAILED, EBADMSG);
+
 static std::string read_outcome(const std::string &name) {
     bootparam_chip chip;
     char untouched = '\0';
@@ -95,7 +107,7 @@ static std::string read_outcome(const std::string &name) {
     if (result != BOOTPARAM_OK) {
         check_failure(result, error, errno);
         hold(value == &untouched, "a failure leaves the value alone", name);
-        return std::to_string(result);
+        return failed(result, error);
     }
     const std::string text = value;
     std::free(value);
@@ -122,10 +134,10 @@ static bool is_acceptable(const std::string &name, const std::string &value) {
 
 static void check_written(const outcomes &before, const outcomes &after, const std::string &name,
                           const std::string &value) {
-    const std::string blank = std::to_string(BOOTPARAM_BLANK);
+    const std::string blank = failed(BOOTPARAM_BLANK, ENODATA);
     hold(after.at(name) == "=" + value, "what was written is read", after.at(name));
     for (const auto &[other, outcome] : before) {
-        const std::string &expected = outcome == blank ? std::to_string(BOOTPARAM_ABSENT) : outcome;
+        const std::string &expected = outcome == blank ? failed(BOOTPARAM_ABSENT, ENOENT) : outcome;
         hold(other == name || after.at(other) == expected, "every other parameter stays",
              other + " " + outcome + " became " + after.at(other));
     }
@@ -153,14 +165,21 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
     const std::size_t copy_size = SIZES[(choices & 8) != 0 ? 1 : 0];
     const std::string name = parts[3].substr(0, parts[3].find('\n')).c_str();
     const std::string value = parts[4].substr(0, parts[4].find('\n')).c_str();
+    const bool is_valid[] = {(choices & 1) == 0, has_two && (choices & 2) == 0};
+    // What follows a short text: zero, or what lets it have no end.
+    const char filler = (choices & 64) == 0 ? '\0' : 'x';
     const images before = {
-        {image_of(parts[1], copy_size, has_two, (choices & 1) == 0),
-         has_two ? image_of(parts[2], copy_size, has_two, (choices & 2) == 0) : ""}
+        {image_of(parts[1], copy_size, has_two, is_valid[0], filler),
+         has_two ? image_of(parts[2], copy_size, has_two, is_valid[1], filler) : ""}
     };
+    const bool is_refused = (is_valid[0] && is_endless(before.copies[0], has_two)) ||
+                            (is_valid[1] && is_endless(before.copies[1], has_two));
 
     lay(before, copy_size, has_two);
     const outcomes read_before = read_all(name);
     hold(lying(has_two) == before, "a read changes nothing");
+    hold((read_before.at("SERNO") == REFUSED) == is_refused,
+         "a block is refused where a valid copy has no end", read_before.at("SERNO"));
 
     bootparam_chip chip;
     int error = 0;
@@ -170,6 +189,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size
         check_failure(result, error, errno);
     hold((result == BOOTPARAM_INVALID) == !is_acceptable(name, value),
          "names and values are refused that no boot block takes", name);
+    hold((failed(result, error) == REFUSED) == (is_refused && is_acceptable(name, value)),
+         "such a block is not written", failed(result, error));
     const images after = lying(has_two);
     if (result == BOOTPARAM_OK)
         check_written(read_before, read_all(name), name, value);

@@ -2,12 +2,15 @@
 #include "tests/unit/platform/boot_block.h"
 
 #include <cerrno>
+#include <cstdint>
 #include <cstdlib>
+#include <cstring>
 #include <fstream>
 #include <iterator>
 
 #include <sys/mount.h>
 #include <unistd.h>
+#include <zlib.h>
 
 #include <glib.h>
 
@@ -70,6 +73,14 @@ void BootParam::make_blank(std::size_t size) {
 std::string BootParam::config_of_two(std::size_t size) {
     g_autofree char *hex = g_strdup_printf("0x%zx", size);
     return copy(0) + " 0x0 " + hex + "\n" + copy(1) + " 0x0 " + hex + "\n";
+}
+
+std::string BootParam::image(const std::string &parameters, const std::string &counter) {
+    const auto crc = static_cast<std::uint32_t>(
+        crc32_z(0, reinterpret_cast<const Bytef *>(parameters.data()), parameters.size()));
+    std::string bytes(sizeof crc, '\0');
+    std::memcpy(bytes.data(), &crc, sizeof crc);
+    return bytes + counter + parameters;
 }
 
 void BootParam::break_copy(int number) {

@@ -24,6 +24,8 @@ class BootParam : public testing::Test {
     static void make_blank(std::size_t size = COPY_SIZE);
     // The description of the two copies.
     static std::string config_of_two(std::size_t size = COPY_SIZE);
+    // A copy with a right CRC; the counter, where there is one, stands between it and the bytes.
+    static std::string image(const std::string &parameters, const std::string &counter = "");
     // Changes a byte among the parameters, so that the CRC is wrong.
     static void break_copy(int number);
 
