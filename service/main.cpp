@@ -15,6 +15,7 @@
 #include "service/intake.h"
 #include "service/method_table.h"
 #include "service/quit_signals.h"
+#include "service/read_buffer.h"
 #include "service/request.h"
 #include "service/service_state.h"
 #include "service/watchdog.h"
@@ -34,6 +35,7 @@ static void on_bus_acquired(GDBusConnection *connection, const char *, gpointer 
     state->connection = connection;
     // Before there is anything to call.
     intake_guard(connection, OBJECT_PATH, privane_system__interface_info());
+    read_buffer_guard(connection);
     (void)g_dbus_interface_skeleton_export(G_DBUS_INTERFACE_SKELETON(state->skeleton), connection,
                                            OBJECT_PATH, nullptr);
     g_message("Policy Server now registered with the name '%s' and object '%s'", BUS_NAME,

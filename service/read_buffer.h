@@ -1,0 +1,15 @@
+// service/read_buffer.h: keeps passwords from staying where GDBus reads messages into.
+//
+// GDBus reads all messages of a connection into one buffer and never clears it: the end of a
+// message stays there until another one is as long. Behind a call that carries a password, the
+// service therefore sends a message of zeros to itself, which goes through the same buffer.
+#pragma once
+
+#include <gio/gio.h>
+
+// What of a message is overwritten. Longer are only lists of the digest file, whose end stays.
+inline constexpr gsize READ_BUFFER_OVERWRITTEN = gsize{64} * 1024;
+
+// For as long as the connection lives. To be called behind intake_guard, which bounds how many
+// calls there are and lets nobody else see the zeros.
+void read_buffer_guard(GDBusConnection *connection);
