@@ -1,12 +1,12 @@
 """tests/bus/test_account_queries.py: what all methods that read the accounts have in common."""
 import pytest
 
-from harness.service_fixtures import StartService
 from harness.accounts import HASH, STANDARD_GROUP, STANDARD_PASSWD, STANDARD_SHADOW, AccountFiles
 from harness.bus import Bus, User, domain_error, error_of
 from harness.fake_authz import FakeAuthz
 from harness.interface import QUERIES, Method
 from harness.service import Service
+from harness.service_fixtures import StartService
 from harness.syslog_socket import SyslogSocket
 from harness.world import Neighbour, snapshot
 

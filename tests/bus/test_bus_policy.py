@@ -4,13 +4,13 @@ from pathlib import Path
 
 import pytest
 
-from conftest import StartService
 from harness.bus import ACCESS_DENIED, KINDS, NAME, Bus, User, domain_error, error_of
 from harness.fake_authz import FakeAuthz
 from harness.interface import ACTION_PREFIX, METHODS
 from harness.polkit import hanging_polkitd
 from harness.sandbox import fake_library
 from harness.service import Service
+from harness.service_fixtures import StartService
 from harness.strace import Attached
 from harness.wire import Wire
 

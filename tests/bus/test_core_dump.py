@@ -6,10 +6,10 @@ from pathlib import Path
 
 import pytest
 
-from conftest import StartService
 from harness.bus import Bus
 from harness.deadline import wait_for
 from harness.fake_authz import FakeAuthz
+from harness.service_fixtures import StartService
 
 
 def dumping(folder: Path) -> list[str]:

@@ -4,11 +4,11 @@ from typing import Callable, Iterator
 
 import pytest
 
-from harness.service_fixtures import StartService
 from harness.accounts import HASH, AccountFiles
 from harness.bus import Bus
 from harness.fake_authz import FakeAuthz
 from harness.service import Service
+from harness.service_fixtures import StartService
 from harness.syslog_socket import SyslogSocket
 
 LOG_ERR = 3

@@ -3,7 +3,6 @@ import time
 
 import pytest
 
-from conftest import StartService
 from harness.accounts import CLERK_UID
 from harness.bus import Bus, BusError, User, domain_error, error_of
 from harness.deadline import wait_for
@@ -12,6 +11,7 @@ from harness.interface import (ACTION_PREFIX, DECLARED_ACTIONS, METHODS, QUERIES
 from harness.polkit import ExampleRules, actions, check, hanging_polkitd
 from harness.sandbox import fake_library
 from harness.service import Service
+from harness.service_fixtures import StartService
 
 # The answers of EnumerateActions: not authorized for any session, nor for an active one.
 REFUSED_TO_ALL = (0, 0, 0)

@@ -3,12 +3,12 @@ from typing import Callable, Iterator
 
 import pytest
 
-from harness.service_fixtures import StartService
 from harness.accounts import AccountFiles
 from harness.bus import Bus, domain_error, error_of
 from harness.fake_authz import FakeAuthz
 from harness.sandbox import fake_library
 from harness.service import Service
+from harness.service_fixtures import StartService
 
 # dbus-daemon's limit for a message, beyond which it drops the connection of the sender.
 MESSAGE_LIMIT = 32 * 1024 * 1024

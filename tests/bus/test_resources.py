@@ -3,9 +3,9 @@ import signal
 
 import pytest
 
-from harness.service_fixtures import StartService
 from harness.bus import Bus, BusError
 from harness.fake_authz import FakeAuthz
+from harness.service_fixtures import StartService
 
 # The status that tells of a finding, since the service itself would end with 0 or 1.
 FOUND = 99

@@ -4,12 +4,12 @@ That no log and no error text carries one is checked at the end of every test th
 """
 from pathlib import Path
 
-from harness.service_fixtures import StartService
 from harness.accounts import AccountFiles
 from harness.bus import Bus, error_of
 from harness.fake_authz import FakeAuthz
 from harness.passwords import MARK, NEW, OLD
 from harness.sandbox import BINARY
+from harness.service_fixtures import StartService
 from harness.strace import Trace
 from harness.world import Neighbour
 

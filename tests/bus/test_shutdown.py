@@ -6,12 +6,12 @@ from typing import Iterator
 
 import pytest
 
-from harness.service_fixtures import StartService
 from harness.bus import Bus
 from harness.deadline import wait_for
 from harness.fake_authz import FakeAuthz
 from harness.sandbox import start_bus
 from harness.service import INITIALIZING, STARTING, STOP_SECONDS
+from harness.service_fixtures import StartService
 from harness.strace import Trace
 
 QUIT_SIGNALS = [signal.SIGHUP, signal.SIGINT, signal.SIGTERM]

@@ -5,13 +5,13 @@ from pathlib import Path
 
 import pytest
 
-from harness.service_fixtures import StartService
 from harness import process
 from harness.bus import Bus
 from harness.deadline import wait_for
 from harness.fake_authz import FakeAuthz
 from harness.sandbox import BINARY, fake_library
 from harness.service import INITIALIZING, REGISTERED, STARTING
+from harness.service_fixtures import StartService
 from harness.strace import Trace
 from harness.syslog_socket import SyslogSocket
 

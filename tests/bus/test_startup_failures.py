@@ -4,13 +4,13 @@ from pathlib import Path
 
 import pytest
 
-from harness.service_fixtures import StartService
 from harness.accounts import (GROUP, PASSWD, SHADOW, STANDARD_PASSWD, STANDARD_SHADOW,
                               AccountFiles)
 from harness.bus import Bus
 from harness.fake_authz import FakeAuthz
 from harness.sandbox import fake_library
 from harness.service import INITIALIZING, Service
+from harness.service_fixtures import StartService
 from harness.strace import Trace
 from harness.syslog_socket import SyslogSocket
 

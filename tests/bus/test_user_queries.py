@@ -3,10 +3,10 @@ from typing import Callable, Iterator
 
 import pytest
 
-from harness.service_fixtures import StartService
 from harness.accounts import HASH, AccountFiles
 from harness.bus import Bus
 from harness.fake_authz import FakeAuthz
+from harness.service_fixtures import StartService
 
 Serve = Callable[..., Bus]
 

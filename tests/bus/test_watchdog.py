@@ -6,7 +6,6 @@ from typing import Callable, Iterator
 
 import pytest
 
-from conftest import StartService
 from harness import process
 from harness.bus import Bus
 from harness.deadline import wait_for
@@ -15,6 +14,7 @@ from harness.fake_authz import FakeAuthz
 from harness.notify_socket import Notice, NotifySocket
 from harness.sandbox import fake_library
 from harness.service import Service
+from harness.service_fixtures import StartService
 from harness.stage import Stage
 
 WATCHED_US = 300_000
