@@ -269,7 +269,6 @@ static bool accept_call(intake *self, GDBusConnection *connection, GDBusMessage 
     }
     const gsize cost = cost_of(g_dbus_message_get_body(call));
     if (cost > INTAKE_CALL_COST) {
-        trim_after_this_message();
         refuse(self, connection, call, LIMITS_EXCEEDED, "The arguments of the call are too large");
         return false;
     }
@@ -333,6 +332,8 @@ static GDBusMessage *on_message(GDBusConnection *connection, GDBusMessage *messa
     }
     if (accept(self, connection, message))
         return message;
+    if (cost_of(g_dbus_message_get_body(message)) > INTAKE_SMALL_COST)
+        trim_after_this_message();
     g_object_unref(message);
     return nullptr;
 }

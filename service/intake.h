@@ -5,6 +5,7 @@
 // the service without any action, and keep those with one waiting for minutes. The numbers below
 // bound memory and the time for which anybody waits: with polkit's answer, a call that is refused
 // for want of an action takes up to 5 ms, so all that may wait together is done within a second.
+// That holds for a polkit that answers at once; one that hangs holds up each call for the deadline.
 //
 // A message reaches the filter when GDBus has built it, one at a time: what a single message costs
 // until then, at most the bus's limit for one, is not bounded here.

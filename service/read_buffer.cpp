@@ -1,9 +1,12 @@
-// service/read_buffer.cpp: the message filter that sends zeros behind a password; GDBus's own
+// service/read_buffer.cpp: the message filter that sends zeros behind a password. GDBus's own
 // thread runs it.
 #include "service/read_buffer.h"
 
 #include <algorithm>
 #include <string_view>
+
+static constexpr const char *ZEROS_INTERFACE = "com.zintor.PrivaneSystem";
+static constexpr const char *ZEROS_MEMBER = "Zeros";
 
 // All whose arguments hold a password or its hash.
 static constexpr std::string_view secret_members[] = {
@@ -15,6 +18,14 @@ static constexpr std::string_view secret_members[] = {
 // allows are 255 bytes, and there are four of them.
 static constexpr gsize HEADER_ROOM = 2048;
 
+// A short text of a list takes up to four times as much in a message as in its value.
+static constexpr gsize WIRE_FACTOR = 4;
+
+struct read_buffer {
+    gsize under_way;  // zeros that were sent and have not come back
+    gsize wanted;     // by calls that came meanwhile
+};
+
 static bool carries_secret(GDBusMessage *message) {
     const char *member = g_dbus_message_get_member(message);
     return g_dbus_message_get_message_type(message) == G_DBUS_MESSAGE_TYPE_METHOD_CALL &&
@@ -23,29 +34,55 @@ static bool carries_secret(GDBusMessage *message) {
                std::end(secret_members);
 }
 
-static void send_zeros(GDBusConnection *connection, gsize count) {
+static gsize length_of(GDBusMessage *message) {
+    GVariant *body = g_dbus_message_get_body(message);
+    const gsize size = body != nullptr ? g_variant_get_size(body) : 0;
+    return std::min(size * WIRE_FACTOR + HEADER_ROOM, READ_BUFFER_OVERWRITTEN);
+}
+
+static void send_zeros(read_buffer *self, GDBusConnection *connection) {
+    const gsize count = self->wanted;
     g_autofree char *zeros = static_cast<char *>(g_malloc0(count));
-    g_autoptr(GDBusMessage) message =
-        g_dbus_message_new_signal("/", "com.zintor.PrivaneSystem", "Zeros");
+    g_autoptr(GDBusMessage) message = g_dbus_message_new_signal("/", ZEROS_INTERFACE, ZEROS_MEMBER);
     g_dbus_message_set_destination(message, g_dbus_connection_get_unique_name(connection));
     g_dbus_message_set_body(
         message, g_variant_new("(@ay)", g_variant_new_fixed_array(G_VARIANT_TYPE_BYTE, zeros, count,
                                                                   sizeof *zeros)));
+    self->under_way = count;
+    self->wanted = 0;
     // It fails only when the connection is closed, and the service with it.
     (void)g_dbus_connection_send_message(connection, message, G_DBUS_SEND_MESSAGE_FLAGS_NONE,
                                          nullptr, nullptr);
 }
 
+// Only the bus says who sent a message.
+static bool are_own_zeros(GDBusConnection *connection, GDBusMessage *message) {
+    return g_dbus_message_get_message_type(message) == G_DBUS_MESSAGE_TYPE_SIGNAL &&
+           g_strcmp0(g_dbus_message_get_member(message), ZEROS_MEMBER) == 0 &&
+           g_strcmp0(g_dbus_message_get_sender(message),
+                     g_dbus_connection_get_unique_name(connection)) == 0;
+}
+
 static GDBusMessage *on_message(GDBusConnection *connection, GDBusMessage *message,
-                                gboolean incoming, void *) {
-    if (incoming != FALSE && carries_secret(message)) {
-        GVariant *body = g_dbus_message_get_body(message);
-        const gsize size = body != nullptr ? g_variant_get_size(body) : 0;
-        send_zeros(connection, std::min(size + HEADER_ROOM, READ_BUFFER_OVERWRITTEN));
-    }
-    return message;
+                                gboolean incoming, void *data) {
+    auto *self = static_cast<read_buffer *>(data);
+
+    // Outgoing messages come from other threads, and are nobody's here.
+    if (incoming == FALSE)
+        return message;
+    if (carries_secret(message))
+        self->wanted = std::max(self->wanted, length_of(message));
+    const bool has_returned = are_own_zeros(connection, message);
+    if (has_returned)
+        self->under_way = 0;
+    if (self->wanted > 0 && self->under_way == 0)
+        send_zeros(self, connection);
+    if (!has_returned)
+        return message;
+    g_object_unref(message);
+    return nullptr;
 }
 
 void read_buffer_guard(GDBusConnection *connection) {
-    (void)g_dbus_connection_add_filter(connection, on_message, nullptr, nullptr);
+    (void)g_dbus_connection_add_filter(connection, on_message, g_new0(read_buffer, 1), g_free);
 }

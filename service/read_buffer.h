@@ -1,8 +1,10 @@
 // service/read_buffer.h: keeps passwords from staying where GDBus reads messages into.
 //
 // GDBus reads all messages of a connection into one buffer and never clears it: the end of a
-// message stays there until another one is as long. Behind a call that carries a password, the
-// service therefore sends a message of zeros to itself, which goes through the same buffer.
+// message stays there until another one is as long. Behind a call that carries a password, whether
+// it is served or refused, the service therefore sends a message of zeros to itself, which goes
+// through the same buffer. Of these there is one at a time, so that nobody can fill the bus's queue
+// with them.
 #pragma once
 
 #include <gio/gio.h>
@@ -10,6 +12,6 @@
 // What of a message is overwritten. Longer are only lists of the digest file, whose end stays.
 inline constexpr gsize READ_BUFFER_OVERWRITTEN = gsize{64} * 1024;
 
-// For as long as the connection lives. To be called behind intake_guard, which bounds how many
-// calls there are and lets nobody else see the zeros.
+// For as long as the connection lives. To be called before intake_guard, whose filter lets through
+// neither refused calls nor the zeros.
 void read_buffer_guard(GDBusConnection *connection);

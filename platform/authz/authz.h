@@ -12,7 +12,7 @@ enum authz_error {
     AUTHZ_ERROR_REFUSED = 1, /* the caller may not, or only after giving a password */
     AUTHZ_ERROR_FAILED = 2,  /* the service cannot decide: for one, the action is not declared */
     AUTHZ_ERROR_UNREACHABLE = 3, /* the bus or the authorization service cannot be reached */
-    AUTHZ_ERROR_TIMED_OUT = 4,   /* no answer in time: see the build's authz_deadline_ms */
+    AUTHZ_ERROR_TIMED_OUT = 4,   /* no answer: 10 s at start, the build's authz_deadline_ms later */
     AUTHZ_ERROR_INVALID = 5      /* no unique bus name, or not the form of an action ID */
 };
 

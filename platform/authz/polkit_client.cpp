@@ -24,8 +24,10 @@ static constexpr guint32 NO_INTERACTION = 0;
 static constexpr int BUS_DEADLINE_MS = 1000;
 
 // The bus drops an answer when others fill what it keeps for this process. So what is not answered
-// by then is asked once more; polkit takes its time, and any answer will do.
-static constexpr guint REPEAT_MS = 1000;
+// by then is asked once more, and again after twice the time each: polkit also works on the
+// questions whose answers nobody needs any more, and must not be kept from the next ones. Any
+// answer will do.
+static constexpr guint FIRST_REPEAT_MS = 1000;
 
 enum class polkit_answer { ALLOWED, REFUSED, NEEDS_PASSWORD };
 
@@ -45,6 +47,8 @@ struct question {
 struct pending_check {
     const question *asked;
     GCancellable *cancellable;
+    GSource *silence;  // of the next repetition; owned
+    guint silence_ms;
     guint unanswered;
     GVariant *answer;  // the first, or
     GError *error;     // why there is none
@@ -107,21 +111,36 @@ static void send_question(pending_check *pending) {
         remaining_ms(pending->asked->deadline), pending->cancellable, on_answer, pending);
 }
 
-static gboolean on_silence(void *pending) {
-    send_question(static_cast<pending_check *>(pending));
-    return G_SOURCE_CONTINUE;
+static gboolean on_silence(void *data);
+
+static void await_silence(pending_check *pending, guint ms) {
+    pending->silence = g_timeout_source_new(ms);
+    pending->silence_ms = ms;
+    g_source_set_callback(pending->silence, on_silence, pending, nullptr);
+    (void)g_source_attach(pending->silence, client_context);  // It is destroyed by its pointer.
+}
+
+static void end_silence(pending_check *pending) {
+    g_source_destroy(pending->silence);
+    g_clear_pointer(&pending->silence, g_source_unref);
+}
+
+static gboolean on_silence(void *data) {
+    auto *pending = static_cast<pending_check *>(data);
+
+    end_silence(pending);
+    send_question(pending);
+    await_silence(pending, 2 * pending->silence_ms);
+    return G_SOURCE_REMOVE;
 }
 
 // Runs in the context of the questions. At the deadline the calls end by themselves.
 static void await_answer(pending_check *pending) {
-    g_autoptr(GSource) silence = g_timeout_source_new(REPEAT_MS);
-    g_source_set_callback(silence, on_silence, pending, nullptr);
-    (void)g_source_attach(silence, client_context);  // Its number is not needed to destroy it.
-
     send_question(pending);
+    await_silence(pending, FIRST_REPEAT_MS);
     while (!has_ended(*pending))
         (void)g_main_context_iteration(client_context, TRUE);  // Whatever ran, the answer decides.
-    g_source_destroy(silence);
+    end_silence(pending);
 
     if (pending->unanswered > 0)
         g_cancellable_cancel(pending->cancellable);
@@ -131,7 +150,7 @@ static void await_answer(pending_check *pending) {
 
 static bool ask_once(const question &asked, polkit_answer *out_answer, GError **error) {
     g_autoptr(GCancellable) cancellable = g_cancellable_new();
-    pending_check pending = {&asked, cancellable, 0, nullptr, nullptr};
+    pending_check pending = {&asked, cancellable, nullptr, 0, 0, nullptr, nullptr};
     gboolean is_authorized = FALSE;
     gboolean needs_password = FALSE;
 
@@ -239,6 +258,8 @@ static void set_failure(const char *action_id, gint64 deadline, GError *cause, G
         code = AUTHZ_ERROR_FAILED;
         reason = "the answer has no valid form";
     } else if (g_error_matches(cause, G_IO_ERROR, G_IO_ERROR_TIMED_OUT) ||
+               // So many earlier questions are still unanswered.
+               g_error_matches(cause, G_DBUS_ERROR, G_DBUS_ERROR_LIMITS_EXCEEDED) ||
                remaining_ms(deadline) == 0) {
         code = AUTHZ_ERROR_TIMED_OUT;
         reason = "no answer in time";

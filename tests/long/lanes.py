@@ -10,12 +10,13 @@ CORES = 2
 
 class Lanes:
     """A context manager, which waits at its end for what still runs. report gets each proof and its
-    outcome, never two at the same time."""
+    outcome, never two at the same time; what it raises is raised at the end."""
 
     def __init__(self, report: Callable[[proofs.Proof, proofs.Outcome], None]) -> None:
         self._report = report
         self._changed = threading.Condition()
         self._running: set[proofs.Proof] = set()
+        self._broken: Exception | None = None
 
     def __enter__(self) -> "Lanes":
         return self
@@ -23,6 +24,8 @@ class Lanes:
     def __exit__(self, *_: object) -> None:
         with self._changed:
             self._changed.wait_for(lambda: not self._running)
+        if self._broken is not None:
+            raise self._broken
 
     def _fits(self, proof: proofs.Proof) -> bool:
         taken = sum(running.cores for running in self._running)
@@ -38,10 +41,15 @@ class Lanes:
             threading.Thread(target=self._run, args=(proof, amount, seed)).start()
 
     def _run(self, proof: proofs.Proof, amount: int, seed: int) -> None:
-        outcome = proofs.run(proof, amount, seed)
+        try:
+            outcome = proofs.run(proof, amount, seed)
+        except OSError as error:
+            outcome = proofs.Outcome(False, {}, f"{proof.name} did not start: {error}\n", 0)
         with self._changed:
             try:
                 self._report(proof, outcome)
+            except Exception as error:
+                self._broken = error
             finally:
                 self._running.remove(proof)
                 self._changed.notify_all()

@@ -134,3 +134,17 @@ def test_the_proof_furthest_from_its_aim_is_next_and_each_start_has_its_own_seed
     seeds = (tmp_path / "seeds").read_text().split()
     assert sorted(seeds[:5], key=int) == ["2", "2", "3", "4", "5"]
     assert json.loads((tmp_path / "figures.json").read_text())["far"]["counts"]["points"] >= 40
+
+
+def test_a_proof_that_cannot_start_has_failed_and_a_broken_report_is_told() -> None:
+    outcomes = []
+    missing = Proof("missing", ("/nonexistent/program",), "points", 1, 1, 1, 1)
+    with Lanes(lambda proof, outcome: outcomes.append(outcome)) as lanes:
+        lanes.start(lambda running: (missing, 1, 1))
+    assert [outcome.passed for outcome in outcomes] == [False]
+
+    def report(proof: Proof, outcome: proofs.Outcome) -> None:
+        raise OSError("disk full")
+    with pytest.raises(OSError, match="disk full"):
+        with Lanes(report) as lanes:
+            lanes.start(lambda running: (missing, 1, 1))

@@ -27,6 +27,11 @@ class Seen:
     arguments: tuple[object, ...]
     error_name: str | None
 
+    def are_zeros(self) -> bool:
+        """What the service sends itself behind a password, to overwrite what it was read into."""
+        return (self.type == SIGNAL and self.member == "Zeros" and self.destination == self.sender
+                and len(self.arguments) == 1 and not any(self.arguments[0]))
+
 
 class Monitor(Wire):
     """A connection of root that only listens."""

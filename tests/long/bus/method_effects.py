@@ -74,7 +74,8 @@ def require_effect(method: Method, seen: Evidence) -> None:
         shown.append(any(said.destination == SYSTEMD and said.member == UNIT_CALLS[member]
                          for said in seen.messages))
     if member == "RtspreadConfig":
-        shown.append(any(said.type == SIGNAL for said in seen.messages))
+        shown.append(any(said.type == SIGNAL and said.member == "UserDatabaseUpdated"
+                         for said in seen.messages))
     if member in TOLD | {"UpdateReleaseFile"}:
         shown.append(isinstance(seen.answer, Answer) and seen.answer.error is None)
     assert shown and all(shown), (member, seen)
