@@ -9,7 +9,7 @@
 
 #include <gio/gio.h>
 
-// What of a message is overwritten. Longer are only lists of the digest file, whose end stays.
+// What is overwritten, at most. Longer are only lists of the digest file, whose end stays.
 inline constexpr gsize READ_BUFFER_OVERWRITTEN = gsize{64} * 1024;
 
 // For as long as the connection lives. To be called before intake_guard, whose filter lets through

@@ -13,7 +13,6 @@ NEEDS = {
     "cache": "touch /var/cache/sysflash/probe",
     "elsewhere": "touch /srv/firmware/probe",
     "home": "grep -q there /root/probe",
-    "program": "/opt/maker/program",
     "network": "bash -c 'echo >/dev/udp/127.0.0.1/9'",
     "ipv6": "perl -e 'socket(S, 10, 2, 0) or exit 1'",
     "netlink": "perl -e 'socket(S, 16, 3, 0) or exit 1'",
@@ -31,8 +30,7 @@ def maker(camera: Camera) -> Camera:
     """A camera with a needy sysflash."""
     camera.put_file("/usr/sbin/sysflash", SYSFLASH.encode(), 0o755)
     camera.put_file("/root/probe", b"there\n")
-    camera.run("mkdir -p /srv/firmware /opt/maker && cp /usr/bin/true /opt/maker/program && "
-               "mkdir -p /var/lib/sysflash /var/cache/sysflash").check()
+    camera.run("mkdir -p /srv/firmware /var/lib/sysflash /var/cache/sysflash").check()
     # The camera's own drop-in gives sysflash a folder.
     camera.run(f"rm {FOLDER}/camera.conf && systemctl daemon-reload").check()
     camera.run(["systemctl", "restart", UNIT]).check()

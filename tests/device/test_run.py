@@ -53,7 +53,7 @@ def test_without_a_terminal(build_dir: Path) -> None:
 
 def test_on_a_terminal_it_ends_in_a_shell(build_dir: Path) -> None:
     with Terminal([TREE / "run", "--build", build_dir]) as run:
-        run.wait_for("leave it with exit or Ctrl-]")
+        run.wait_for("leave it with exit or Ctrl-]", seconds=300)  # the whole tour, with a reboot
         run.wait_for(PROMPT)
         run.type(b"exit\n")
         run.wait_for("powering the camera off")

@@ -256,7 +256,7 @@ class Unit(unittest.TestCase):
 
     def test_nothing_that_breaks_a_method_is_set_and_the_unit_says_why(self):
         comments = "\n".join(line for line in self.text.splitlines() if line.startswith("#"))
-        for key in ("MemoryMax", "PrivateDevices", "PrivateNetwork", "PrivateTmp", "PrivateUsers",
+        for key in ("MemoryMax", "NoExecPaths", "PrivateDevices", "PrivateNetwork", "PrivateTmp", "PrivateUsers",
                     "ProcSubset", "ProtectClock", "RestrictFileSystems", "RootDirectory", "TasksMax",
                     "UMask", "User"):
             self.assertEqual(self.value_of(key), [], key)
