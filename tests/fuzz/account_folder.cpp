@@ -3,7 +3,6 @@
 #include "tests/fuzz/account_folder.h"
 
 #include <shadow.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cstdio>
@@ -11,7 +10,7 @@
 #include <optional>
 
 #include "tests/fuzz/fuzz.h"
-#include "tests/fuzz/scratch.h"
+#include "tests/fuzz/memory_files.h"
 
 using optional_text = std::optional<std::string>;
 
@@ -29,51 +28,54 @@ account_texts texts_of(const std::vector<std::string> &parts) {
 }
 
 void lay(const account_texts &texts) {
-    enter_scratch_etc();
-    write_whole("etc/passwd", texts.passwd);
-    write_whole("etc/group", texts.group);
+    lay_memory_file("etc/passwd", texts.passwd);
+    lay_memory_file("etc/group", texts.group);
     if (texts.has_shadow)
-        write_whole("etc/shadow", texts.shadow);
+        lay_memory_file("etc/shadow", texts.shadow);
     else
-        (void)unlink("etc/shadow");
+        remove_memory_file("etc/shadow");
 }
 
 static std::string with_members_sorted(const std::string &group_file) {
     std::string sorted;
-    for (const std::string &line : lines_of(group_file)) {
+    views members;
+    for (const std::string_view line : lines_of(group_file)) {
         const std::size_t start = line.rfind(':') + 1;
-        std::vector<std::string> members = split(line.substr(start), ',');
+        split_into(line.substr(start), ',', &members);
         std::sort(members.begin(), members.end());
         sorted += line.substr(0, start);
-        for (const std::string &member : members)
-            sorted += member + ",";
-        sorted += "\n";
+        for (const std::string_view member : members) {
+            sorted += member;
+            sorted += ',';
+        }
+        sorted += '\n';
     }
     return sorted;
 }
 
 account_texts lying_texts() {
-    return {read_whole("etc/passwd"), read_whole("etc/shadow"),
-            with_members_sorted(read_whole("etc/group")), access("etc/shadow", F_OK) == 0, 0};
+    return {text_of_memory_file("etc/passwd"), text_of_memory_file("etc/shadow"),
+            with_members_sorted(text_of_memory_file("etc/group")), has_memory_file("etc/shadow"),
+            0};
 }
 
 bool is_any_temporary_left() {
-    return access("etc/passwd.tmp", F_OK) == 0 || access("etc/shadow.tmp", F_OK) == 0 ||
-           access("etc/group.tmp", F_OK) == 0;
+    return has_memory_file("etc/passwd.tmp") || has_memory_file("etc/shadow.tmp") ||
+           has_memory_file("etc/group.tmp");
 }
 
-static std::string members_of(const internal_group *group) {
-    std::vector<std::string> members;
+static void add_members(const internal_group *group, std::string *out_text) {
+    views members;
     GHashTableIter iter;
     gpointer member;
     g_hash_table_iter_init(&iter, group->members);
     while (g_hash_table_iter_next(&iter, &member, nullptr))
         members.emplace_back(static_cast<const char *>(member));
     std::sort(members.begin(), members.end());
-    std::string text;
-    for (const std::string &one : members)
-        text += one + ",";
-    return text;
+    for (const std::string_view one : members) {
+        *out_text += one;
+        *out_text += ',';
+    }
 }
 
 // As the files tell it: "*" for no password, whole days, "" for what is absent.
@@ -83,21 +85,30 @@ std::string described(const usermgmt_ctx *ctx) {
         text += value != nullptr ? value : "";
         text += '|';
     };
+    const auto number = [&text](gint64 value) {
+        text += std::to_string(value);
+        text += ' ';
+    };
     for (const internal_user *user : records<const internal_user>(ctx->user_db.entries)) {
         field(user->name);
         field(user->password != nullptr ? user->password : "*");
         field(user->gecos);
         field(user->home);
         field(user->shell);
-        text += std::to_string(user->type) + " " + std::to_string(user->uid) + " " +
-                std::to_string(user->gid) + " " + std::to_string(user->shadowed) + " " +
-                std::to_string(user->last_change / 86400) + "\n";
+        number(user->type);
+        number(user->uid);
+        number(user->gid);
+        number(user->shadowed);
+        number(user->last_change / 86400);
+        text += '\n';
     }
     for (const internal_group *group : records<const internal_group>(ctx->group_db.entries)) {
         field(group->name);
         field(group->password);
-        text += std::to_string(group->type) + " " + std::to_string(group->gid) + " " +
-                members_of(group) + "\n";
+        number(group->type);
+        number(group->gid);
+        add_members(group, &text);
+        text += '\n';
     }
     return text;
 }
@@ -145,7 +156,7 @@ static std::map<std::string, optional_text> first_hashes(const std::string &shad
 static void check_users(const usermgmt_ctx *ctx, const account_texts &texts) {
     const user_database &user_db = ctx->user_db;
     const auto hashes = first_hashes(texts.shadow);
-    std::map<std::string, const internal_user *> last_of_name;
+    std::map<std::string_view, const internal_user *> last_of_name;
 
     for (const internal_user *user : records<const internal_user>(user_db.entries)) {
         last_of_name[user->name] = user;
@@ -164,8 +175,7 @@ static void check_users(const usermgmt_ctx *ctx, const account_texts &texts) {
     hold(g_hash_table_size(user_db.name_hash) == last_of_name.size(),
          "the index of users has one entry for each name");
     for (const auto &[name, user] : last_of_name)
-        hold(user_database_find(&user_db, name.c_str()) == user, "the index finds every user",
-             name);
+        hold(user_database_find(&user_db, user->name) == user, "the index finds every user", name);
 }
 
 static void check_groups(const usermgmt_ctx *ctx) {

@@ -18,30 +18,47 @@ bool is_number_or_empty(std::string_view text) {
     return text.empty() || is_number(text);
 }
 
-std::string text_or_empty(const char *text) {
-    return text != nullptr ? text : "";
+void add_field(const char *text, std::string *out_line) {
+    *out_line += ':';
+    if (text != nullptr)
+        *out_line += text;
+}
+
+void add_field(unsigned long number, std::string *out_line) {
+    *out_line += ':';
+    *out_line += std::to_string(number);
 }
 
 static bool is_plain_name(std::string_view name) {
     return !name.empty() && name.front() != '-' && has_only(name, LETTERS);
 }
 
-static bool is_plain(const std::string &line, const row_rules &rules, fields *out_row) {
-    *out_row = split(line, ':');
-    return line.find('\0') == std::string::npos && out_row->size() == rules.columns &&
-           is_plain_name(out_row->front()) && rules.are_plain(*out_row);
+static bool is_plain(std::string_view line, const row_rules &rules) {
+    static views row;
+    split_into(line, ':', &row);
+    return line.find('\0') == std::string_view::npos && row.size() == rules.columns &&
+           is_plain_name(row.front()) && rules.are_plain(row);
+}
+
+// The colons of the line are as many as belong between a record's fields, so that none of them
+// stands in a field.
+static bool is_of_line(const void *record, const row_rules &rules, std::string_view line) {
+    static std::string own;
+    const char *name = rules.name_of(record);
+    own = name != nullptr ? name : "";
+    rules.add_fields(record, &own);
+    return own == line;
 }
 
 static void check_records(const GPtrArray *records, const row_rules &rules, std::string_view text) {
-    const std::vector<std::string> lines = lines_of(text);
+    const views lines = lines_of(text);
     hold(records->len <= lines.size(), "a line is one record at most", text);
 
     guint next = 0;
-    fields wanted;
-    for (const std::string &line : lines) {
-        if (!is_plain(line, rules, &wanted))
+    for (const std::string_view line : lines) {
+        if (!is_plain(line, rules))
             continue;
-        while (next < records->len && rules.fields_of(g_ptr_array_index(records, next)) != wanted)
+        while (next < records->len && !is_of_line(g_ptr_array_index(records, next), rules, line))
             next++;
         hold(next < records->len, "every plain line is a record, in its place", line);
         next++;

@@ -2,22 +2,19 @@
 // must have come of them.
 #pragma once
 
-#include <functional>
 #include <string>
 #include <string_view>
-#include <vector>
 
+#include "tests/fuzz/fuzz.h"
 #include "usermgmt/core_file.h"
-
-using fields = std::vector<std::string>;
 
 // What is peculiar to one of the files.
 struct row_rules {
     std::size_t columns;
     // Whether the fields, whose number and name are in order, leave no doubt.
-    bool (*are_plain)(const fields &row);
-    // The fields of a record; those that a plain line may not lack are not null.
-    fields (*fields_of)(const void *record);
+    bool (*are_plain)(const views &row);
+    // Adds the fields behind the name, as they stand in a line; what is missing is empty.
+    void (*add_fields)(const void *record, std::string *out_line);
     const char *(*name_of)(const void *record);
 };
 
@@ -25,7 +22,9 @@ struct row_rules {
 bool is_number(std::string_view text);
 bool is_number_or_empty(std::string_view text);
 
-std::string text_or_empty(const char *text);
+// Adds a field and the colon before it.
+void add_field(const char *text, std::string *out_line);
+void add_field(unsigned long number, std::string *out_line);
 
 // Reads the text through the row and compares: every text can be read, every plain line is a record
 // with those fields, in their order, there are no more records than lines, and the name of each

@@ -37,7 +37,7 @@ bool bus_call::end(bool done) {
     if (!done)
         privane_return_error(call.invocation, g_steal_pointer(&call.error));
     hold(call.error == nullptr, "no error is left of a call that was answered", text);
-    hold(answers == 1, "a call is answered once", std::to_string(answers));
+    hold(answers == 1, "a call is answered once", [this] { return std::to_string(answers); });
     hold(is_error == !done, "a method that failed answers with an error, and only that", text);
     return done;
 }

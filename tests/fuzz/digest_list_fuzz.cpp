@@ -30,11 +30,11 @@ static bool is_name(std::string_view text) {
 }
 
 // The name of a whole entry; "" where the line is none.
-static std::string name_in_entry(const std::string &line) {
+static std::string_view name_in_entry(std::string_view line) {
     const std::size_t colon = line.find(':');
-    if (colon == std::string::npos)
+    if (colon == std::string_view::npos)
         return "";
-    const std::string rest = line.substr(colon);
+    const std::string_view rest = line.substr(colon);
     const bool is_entry = rest.starts_with(MIDDLE) && rest.size() == MIDDLE.size() + DIGITS &&
                           has_only(rest.substr(MIDDLE.size()), "0123456789abcdef");
     return is_entry && is_name(line.substr(0, colon)) ? line.substr(0, colon) : "";
@@ -43,10 +43,11 @@ static std::string name_in_entry(const std::string &line) {
 static void check_list(std::string_view list, reader read, bool takes_names, bool keeps_lines) {
     const change_array changes(g_array_new(FALSE, FALSE, sizeof(line_change)));
     const bool accepted = read(list, changes.get());
-    std::vector<std::string> names;
-    const std::vector<std::string> lines = lines_of(list);
+    views names;
+    const views lines = lines_of(list);
 
-    for (const std::string &line : lines)
+    names.reserve(lines.size());
+    for (const std::string_view line : lines)
         names.push_back(takes_names && is_name(line) ? line : name_in_entry(line));
     const bool is_valid = std::find(names.begin(), names.end(), "") == names.end();
     hold(accepted == is_valid, "a list is taken when every line of it is valid", list);

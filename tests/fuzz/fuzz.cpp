@@ -12,9 +12,7 @@ static constexpr std::string_view SEPARATOR = "%%\n";
 // not keep the input.
 static const auto old_trap = std::signal(SIGTRAP, [](int) { std::abort(); });
 
-void hold(bool holds, const char *property, std::string_view detail) {
-    if (holds)
-        return;
+void fail_hold(const char *property, std::string_view detail) {
     (void)std::fprintf(stderr, "\nThis does not hold: %s\n%.*s\n", property,
                        static_cast<int>(std::min<std::size_t>(detail.size(), 4000)), detail.data());
     std::abort();
@@ -40,20 +38,26 @@ std::vector<std::string> parts_of(const std::uint8_t *data, std::size_t size) {
     return parts;
 }
 
-std::vector<std::string> lines_of(std::string_view text) {
-    std::vector<std::string> lines = split(text, '\n');
+views lines_of(std::string_view text) {
+    views lines = split(text, '\n');
     if (lines.back().empty())
         lines.pop_back();
     return lines;
 }
 
-std::vector<std::string> split(std::string_view text, char separator) {
-    std::vector<std::string> texts;
+views split(std::string_view text, char separator) {
+    views texts;
+    texts.reserve(static_cast<std::size_t>(std::count(text.begin(), text.end(), separator)) + 1);
+    split_into(text, separator, &texts);
+    return texts;
+}
+
+void split_into(std::string_view text, char separator, views *out_texts) {
+    out_texts->clear();
     for (std::size_t end; (end = text.find(separator)) != std::string_view::npos;
          text.remove_prefix(end + 1))
-        texts.emplace_back(text.substr(0, end));
-    texts.emplace_back(text);
-    return texts;
+        out_texts->push_back(text.substr(0, end));
+    out_texts->push_back(text);
 }
 
 bool has_only(std::string_view text, std::string_view allowed) {

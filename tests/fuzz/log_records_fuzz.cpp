@@ -88,13 +88,15 @@ static std::string logged(const level &row, const std::string &domain, const std
     g_log(domain.empty() ? nullptr : domain.c_str(), static_cast<GLogLevelFlags>(row.bits), "%s",
           text.c_str());
     hold(errno == ERRNO_BEFORE, "a record leaves errno alone");
-    hold(records.size() == 1, "a record is one write", std::to_string(records.size()));
+    hold(records.size() == 1, "a record is one write",
+         [] { return std::to_string(records.size()); });
     return records[0];
 }
 
 static void check(const level &row, const std::string &domain, const std::string &text,
                   const std::string &line) {
-    hold(line.size() <= MAX_LINE, "a record is bounded", std::to_string(line.size()));
+    hold(line.size() <= MAX_LINE, "a record is bounded",
+         [&line] { return std::to_string(line.size()); });
     hold(g_utf8_validate(line.data(), static_cast<gssize>(line.size()), nullptr),
          "a record is UTF-8", line);
     const std::string shown = line + '\0';

@@ -6,8 +6,9 @@
 #include "platform/paramcli/param_file.h"
 #include "platform/paramcli/param_options.h"
 #include "tests/fuzz/fuzz.h"
-#include "tests/fuzz/scratch.h"
+#include "tests/fuzz/memory_folder.h"
 
+static constexpr const char *NAME = "parameters.conf";
 static constexpr std::size_t MAX_FILE = 1U << 20;
 
 using parameter = std::pair<std::string, std::string>;
@@ -26,10 +27,10 @@ static bool is_value(const std::string &value) {
 // Those that are taken.
 static std::vector<parameter> add_all(const std::string &text, paramcli_options *options) {
     std::vector<parameter> added;
-    for (const std::string &line : lines_of(text)) {
+    for (const std::string_view line : lines_of(text)) {
         const std::size_t middle = line.find('>');
-        const std::string name = line.substr(0, middle);
-        const std::string value = middle != std::string::npos ? line.substr(middle + 1) : "";
+        const std::string name(line.substr(0, middle));
+        const std::string value(middle != std::string_view::npos ? line.substr(middle + 1) : "");
         const std::size_t room = sizeof options->pending - options->length;
         const unsigned length = options->length;
         const int number = param_options_add(options, name, value);
@@ -46,9 +47,9 @@ static std::vector<parameter> add_all(const std::string &text, paramcli_options 
     return added;
 }
 
-static std::optional<std::string> name_of(const std::string &line) {
+static std::optional<std::string_view> name_of(std::string_view line) {
     const std::size_t equals = line.find('=');
-    if (equals == std::string::npos || line.starts_with('#'))
+    if (equals == std::string_view::npos || line.starts_with('#'))
         return std::nullopt;
     return line.substr(0, equals);
 }
@@ -67,15 +68,15 @@ static std::string expected(const std::string &text, const std::vector<parameter
             changed += wanted[i].first + "=" + wanted[i].second + "\n";
         is_done[i] = true;
     };
-    for (const std::string &line : lines_of(text)) {
-        const std::optional<std::string> name = name_of(line);
+    for (const std::string_view line : lines_of(text)) {
+        const std::optional<std::string_view> name = name_of(line);
         std::size_t i = 0;
         while (i < wanted.size() && name != wanted[i].first)
             i++;
         if (i < wanted.size())
             put(i);
         else
-            changed += line + "\n";
+            changed.append(line).append("\n");
     }
     for (std::size_t i = 0; i < wanted.size(); i++)
         put(i);
@@ -83,25 +84,27 @@ static std::string expected(const std::string &text, const std::vector<parameter
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
-    static const std::string path = scratch_path() + "/parameters.conf";
+    static const std::string path = memory_folder_path() + "/" + NAME;
     const std::vector<std::string> parts = parts_of(data, size);
     const std::string &text = parts[0];
     paramcli_options options;
 
-    write_whole(path, text);
+    lay_in_memory_folder(NAME, text);
     param_options_reset(&options);
     const std::vector<parameter> added = add_all(parts.size() > 1 ? parts[1] : "", &options);
     const std::string wanted = added.empty() ? text : expected(text, added);
     const int number = param_file_sync(path.c_str(), &options);
 
     if (wanted.size() > MAX_FILE) {
-        hold(number == PARAMCLI_ERROR_TOO_BIG && read_whole(path) == text,
+        hold(number == PARAMCLI_ERROR_TOO_BIG && text_in_memory_folder(NAME) == text,
              "a file that is too big stays as it was");
         return 0;
     }
     hold(number == PARAMCLI_ERROR_NONE, "valid parameters are stored", std::to_string(number));
     hold(options.length == 0, "what was stored is no longer pending");
-    const std::string stored = read_whole(path);
-    hold(stored == wanted, "the file becomes what it should", stored + "\ninstead of\n" + wanted);
+    hold(count_in_memory_folder() <= 2, "beside the file there is its lock, and nothing else");
+    const std::string stored = text_in_memory_folder(NAME);
+    hold(stored == wanted, "the file becomes what it should",
+         [&] { return stored + "\ninstead of\n" + wanted; });
     return 0;
 }

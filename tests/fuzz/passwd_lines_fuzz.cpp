@@ -3,19 +3,21 @@
 
 #include "tests/fuzz/account_rows.h"
 #include "tests/fuzz/fuzz.h"
-#include "tests/fuzz/memory_file.h"
+#include "tests/fuzz/memory_files.h"
 #include "usermgmt/core_file_records.h"
 
-static bool are_plain(const fields &row) {
+static bool are_plain(const views &row) {
     return is_number(row[2]) && is_number(row[3]);
 }
 
-static fields fields_of(const void *record) {
+static void add_fields(const void *record, std::string *out_line) {
     const auto *line = static_cast<const struct passwd *>(record);
-    return {text_or_empty(line->pw_name),  text_or_empty(line->pw_passwd),
-            std::to_string(line->pw_uid),  std::to_string(line->pw_gid),
-            text_or_empty(line->pw_gecos), text_or_empty(line->pw_dir),
-            text_or_empty(line->pw_shell)};
+    add_field(line->pw_passwd, out_line);
+    add_field(line->pw_uid, out_line);
+    add_field(line->pw_gid, out_line);
+    add_field(line->pw_gecos, out_line);
+    add_field(line->pw_dir, out_line);
+    add_field(line->pw_shell, out_line);
 }
 
 static const char *name_of(const void *record) {
@@ -23,13 +25,12 @@ static const char *name_of(const void *record) {
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t *data, std::size_t size) {
-    static constexpr row_rules rules = {7, are_plain, fields_of, name_of};
-    static const memory_file file;
-    static const core_file row = {CORE_FILE_ROW_PASSWD, "passwd",     file.path(),
+    static constexpr row_rules rules = {7, are_plain, add_fields, name_of};
+    static const core_file row = {CORE_FILE_ROW_PASSWD, "passwd",     "etc/passwd",
                                   fetch_passwd,         write_passwd, free_passwd};
     const std::string_view text(reinterpret_cast<const char *>(data), size);
 
-    file.fill(text);
+    lay_memory_file(row.path, text);
     check_rows(row, rules, text);
     return 0;
 }

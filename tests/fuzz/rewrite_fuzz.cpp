@@ -48,7 +48,7 @@ static void check_rewrite(const account_texts &texts) {
     ctx.reset();
     ctx = opened(0);
     hold(described(ctx.get()) == before, "every record comes back as it was written",
-         before + "became\n" + described(ctx.get()));
+         [&] { return before + "became\n" + described(ctx.get()); });
     hold(error_of_write(ctx.get()).empty(), "what was written can be written again");
     hold(joined(lying_texts()) == once, "the second write changes nothing", once);
 }

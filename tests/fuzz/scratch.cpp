@@ -3,7 +3,6 @@
 
 #include <fcntl.h>
 #include <stdlib.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <filesystem>
@@ -43,11 +42,6 @@ scratch_folder::~scratch_folder() {
 const std::string &scratch_path() {
     static const scratch_folder folder;
     return folder.path();
-}
-
-void enter_scratch_etc() {
-    static const bool entered = chdir(scratch_path().c_str()) == 0 && mkdir("etc", 0700) == 0;
-    hold(entered, "the scratch folder can be entered", scratch_path());
 }
 
 void write_whole(const std::string &path, std::string_view text) {

@@ -8,9 +8,6 @@
 // where, else it is in /dev/shm.
 const std::string &scratch_path();
 
-// Makes it the working folder, with a folder "etc" in it.
-void enter_scratch_etc();
-
 // A whole file, made where it is missing; "" for one that is not there.
 void write_whole(const std::string &path, std::string_view text);
 std::string read_whole(const std::string &path);

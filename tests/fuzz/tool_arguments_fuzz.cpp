@@ -107,13 +107,13 @@ static void check(const diagnostic &row, const std::string &first, const std::st
     const bool done = bus.serve(row.handle, first.c_str(), second.c_str());
     const optional_words expected = row.expected(first, second);
     const bool tool_failed = wait_status != 0;
+    const auto both = [&] { return first + " " + second; };
 
     hold(runs == (expected ? 1 : 0), "a tool is run for the words of the list, and only then",
-         first + " " + second);
-    hold(!expected || run_words == *expected, "the tool gets the words that belong to it",
-         first + " " + second);
+         both);
+    hold(!expected || run_words == *expected, "the tool gets the words that belong to it", both);
     hold(done == (expected && !(row.fails_with_tool && tool_failed)),
-         "a method fails for other words and for nothing else", first + " " + second);
+         "a method fails for other words and for nothing else", both);
     hold(done || bus.code == row.code, "a refusal has the method's code", bus.text);
     if (!done)
         return;

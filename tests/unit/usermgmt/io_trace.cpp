@@ -13,6 +13,12 @@
 
 #include <glib.h>
 
+// What a call on a path or a descriptor is passed on to: the C library's own, or what stands in for
+// it.
+#ifndef REAL_CALLS
+#define REAL_CALLS "__real_"
+#endif
+
 static io_trace *active;
 
 io_trace::io_trace() {
@@ -84,13 +90,13 @@ static int traced_stat(const char *path, struct stat *st,
     return enter("stat", path) ? real(path, st) : -1;
 }
 
-int real_stat(const char *path, struct stat *st) asm("__real_stat");
+int real_stat(const char *path, struct stat *st) asm(REAL_CALLS "stat");
 int wrap_stat(const char *path, struct stat *st) asm("__wrap_stat");
 int wrap_stat(const char *path, struct stat *st) {
     return traced_stat(path, st, real_stat);
 }
 
-int real_stat64(const char *path, struct stat *st) asm("__real_stat64");
+int real_stat64(const char *path, struct stat *st) asm(REAL_CALLS "stat64");
 int wrap_stat64(const char *path, struct stat *st) asm("__wrap_stat64");
 int wrap_stat64(const char *path, struct stat *st) {
     return traced_stat(path, st, real_stat64);
@@ -111,7 +117,7 @@ static mode_t mode_argument(int flags, va_list arguments) {
     return (flags & O_CREAT) != 0 ? va_arg(arguments, mode_t) : 0;
 }
 
-int real_open(const char *path, int flags, ...) asm("__real_open");
+int real_open(const char *path, int flags, ...) asm(REAL_CALLS "open");
 int wrap_open(const char *path, int flags, ...) asm("__wrap_open");
 int wrap_open(const char *path, int flags, ...) {
     va_list arguments;
@@ -121,7 +127,7 @@ int wrap_open(const char *path, int flags, ...) {
     return traced_open(path, flags, mode, real_open);
 }
 
-int real_open64(const char *path, int flags, ...) asm("__real_open64");
+int real_open64(const char *path, int flags, ...) asm(REAL_CALLS "open64");
 int wrap_open64(const char *path, int flags, ...) asm("__wrap_open64");
 int wrap_open64(const char *path, int flags, ...) {
     va_list arguments;
@@ -141,37 +147,37 @@ static FILE *traced_fopen(const char *path, const char *mode,
     return file;
 }
 
-FILE *real_fopen(const char *path, const char *mode) asm("__real_fopen");
+FILE *real_fopen(const char *path, const char *mode) asm(REAL_CALLS "fopen");
 FILE *wrap_fopen(const char *path, const char *mode) asm("__wrap_fopen");
 FILE *wrap_fopen(const char *path, const char *mode) {
     return traced_fopen(path, mode, real_fopen);
 }
 
-FILE *real_fopen64(const char *path, const char *mode) asm("__real_fopen64");
+FILE *real_fopen64(const char *path, const char *mode) asm(REAL_CALLS "fopen64");
 FILE *wrap_fopen64(const char *path, const char *mode) asm("__wrap_fopen64");
 FILE *wrap_fopen64(const char *path, const char *mode) {
     return traced_fopen(path, mode, real_fopen64);
 }
 
-int real_unlink(const char *path) asm("__real_unlink");
+int real_unlink(const char *path) asm(REAL_CALLS "unlink");
 int wrap_unlink(const char *path) asm("__wrap_unlink");
 int wrap_unlink(const char *path) {
     return enter("unlink", path) ? real_unlink(path) : -1;
 }
 
-int real_rename(const char *from, const char *to) asm("__real_rename");
+int real_rename(const char *from, const char *to) asm(REAL_CALLS "rename");
 int wrap_rename(const char *from, const char *to) asm("__wrap_rename");
 int wrap_rename(const char *from, const char *to) {
     return enter("rename", from, std::string(" ") + to) ? real_rename(from, to) : -1;
 }
 
-FILE *real_fdopen(int fd, const char *mode) asm("__real_fdopen");
+FILE *real_fdopen(int fd, const char *mode) asm(REAL_CALLS "fdopen");
 FILE *wrap_fdopen(int fd, const char *mode) asm("__wrap_fdopen");
 FILE *wrap_fdopen(int fd, const char *mode) {
     return enter("fdopen", fd, std::string(" ") + mode) ? real_fdopen(fd, mode) : nullptr;
 }
 
-int real_fchmod(int fd, mode_t mode) asm("__real_fchmod");
+int real_fchmod(int fd, mode_t mode) asm(REAL_CALLS "fchmod");
 int wrap_fchmod(int fd, mode_t mode) asm("__wrap_fchmod");
 int wrap_fchmod(int fd, mode_t mode) {
     return enter("fchmod", fd, in_octal(mode)) ? real_fchmod(fd, mode) : -1;
