@@ -17,6 +17,7 @@
 struct account_case {
     const char *name;
     operation what;
+    const char *answer = "";  // how its error begins where it is refused
 };
 
 // The ten that change accounts, some in more than one form, and what is refused whole.
@@ -69,6 +70,9 @@ class account_runner {
     hashing_sources sources_;
     lines warnings_;
 };
+
+// Whether an operation ended as told: "" is success, anything else how its error begins.
+bool is_answer(const char *expected, const operation_result &result);
 
 // How the files differ from what a model says, "" when they do not.
 std::string difference_from_disk(const account_model &model);

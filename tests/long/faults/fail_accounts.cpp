@@ -48,6 +48,7 @@ class account_failer {
         guint32 flags = 0;
         operation what = {};
         int failing_row = -1;
+        const char *answer = nullptr;  // as a case has it; null where chance decides
     };
     void strike_all(const start &from, guint64 amount);
     void strike_all_of_open(const start &from, guint64 amount);
@@ -109,7 +110,12 @@ bool account_failer::rehearse() {
         report_->fail(from_.name + ": the database does not open: " + slot.error);
         return false;
     }
-    (void)runner_.run(slot.ctx.get(), from_.what, rehearsal_, plan_with(-1, {}));
+    const operation_result result =
+        runner_.run(slot.ctx.get(), from_.what, rehearsal_, plan_with(-1, {}));
+    if (from_.answer != nullptr && !is_answer(from_.answer, result))
+        report_->fail(from_.name + ": it ended otherwise than it was to: " + result.error);
+    if (from_.answer != nullptr && *from_.answer == '\0' && rehearsal_->count == 0)
+        report_->fail(from_.name + ": it makes no call that could fail");
     if (const std::string wrong = judge_order_of_calls(*rehearsal_);
         !wrong.empty() && from_.failing_row < 0)
         report_->fail(from_.name + ": " + wrong);
@@ -282,7 +288,7 @@ void fail_every_account_call(proof_report *report, guint64 amount) {
     for (const guint32 flags : {guint32{0}, guint32{USERMGMT_OPEN_NO_CACHE}})
         failer.strike_all_of_open({"opening", typical_accounts(), flags}, amount);
     for (const account_case &one : account_cases()) {
-        failer.strike_all({one.name, typical_accounts(), 0, one.what}, amount);
+        failer.strike_all({one.name, typical_accounts(), 0, one.what, -1, one.answer}, amount);
         for (int row = 0; row < CORE_FILE_COUNT; row++)
             failer.strike_all({std::string(one.name) + ", reloaded after a failed write",
                                typical_accounts(), USERMGMT_OPEN_NO_CACHE, one.what, row},

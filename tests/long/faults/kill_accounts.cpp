@@ -31,7 +31,8 @@ class account_killer {
         folder_state files;
         guint32 flags;
         operation what;
-        bool is_typical = false;  // its half-done states are on the list
+        const char *answer = nullptr;  // as a case has it; null where chance decides
+        bool is_typical = false;       // its half-done states are on the list
     };
 
     // Runs it to its end. False where that already is not as it has to be.
@@ -70,6 +71,19 @@ void account_killer::fail(const std::string &what) {
     report_->fail(from_.name + " (" + described(from_.what) + "): " + what);
 }
 
+// A replaced file has the mode and the owner of the old one.
+static std::string difference_in_access(const folder_state &before, const folder_state &after) {
+    for (const std::string &name : account_file_names()) {
+        if (before.count(name) == 0 || after.count(name) == 0)
+            continue;
+        const lying_file &old = before.at(name);
+        const lying_file &made = after.at(name);
+        if (old.mode != made.mode || old.owner != made.owner || old.group != made.group)
+            return name + " has another mode or owner";
+    }
+    return "";
+}
+
 bool account_killer::rehearse(const start &from) {
     from_ = from;
     states_.clear();
@@ -87,8 +101,11 @@ bool account_killer::rehearse(const start &from) {
     report_->count("operations");
 
     std::string wrong = judge_order_of_calls(*rehearsal_);
+    if (wrong.empty() && from_.answer != nullptr && !is_answer(from_.answer, result))
+        wrong = "it was to succeed, or to be refused otherwise";
     for (const std::string &next :
-         {model.objection(), model.difference_from(slot.ctx.get()), difference_from_disk(model),
+         {difference_in_access(from_.files, after_), model.objection(),
+          model.difference_from(slot.ctx.get()), difference_from_disk(model),
           judge_root(from.files, after_, after_)})
         wrong = wrong.empty() ? next : wrong;
     if (!wrong.empty())
@@ -198,8 +215,8 @@ std::string account_killer::repeat(usermgmt_ctx *ctx, account_model *model,
     const bool known = again.succeeded ||
                        std::any_of(std::begin(done_before), std::end(done_before),
                                    [&](const char *code) { return again.error.starts_with(code); });
-    // Whom chance refuses before the death is refused after it.
-    if (from_.is_typical && !known && from_.what.name == from_.what.account)
+    // What is refused before the death is refused after it.
+    if (from_.answer != nullptr && !known && !is_answer(from_.answer, again))
         return "repeated, it fails: " + again.error;
     return model->objection().empty() ? difference_from_disk(*model) : model->objection();
 }
@@ -225,7 +242,7 @@ std::string account_killer::recover(const folder_state &now) {
     const operation_result later = runner_.run(slot.ctx.get(), later_operation());
     model.follow(later_operation(), later);
     report_->count("operations");
-    if (!later.succeeded && !later.error.starts_with("usermgmt "))
+    if (!later.succeeded && (from_.answer != nullptr || !later.error.starts_with("usermgmt ")))
         return "the next operation fails: " + later.error;
     for (const std::string &next :
          {model.objection(), model.difference_from(slot.ctx.get()), difference_from_disk(model)})
@@ -267,7 +284,7 @@ void kill_every_account_operation(proof_report *report, guint64 amount) {
     const folder_state accounts = typical_accounts();
     std::vector<std::pair<const account_case *, folder_state>> crashed;
     for (const account_case &one : account_cases()) {
-        strike_all(&killer, report, amount, {one.name, accounts, 0, one.what, true});
+        strike_all(&killer, report, amount, {one.name, accounts, 0, one.what, one.answer, true});
         for (const folder_state &state : new_starts(killer, accounts))
             crashed.emplace_back(&one, state);
     }
@@ -281,7 +298,7 @@ void kill_every_account_operation(proof_report *report, guint64 amount) {
             folder_state files = accounts;
             files.insert(left.files.begin(), left.files.end());
             strike_all(&killer, report, amount,
-                       {std::string(one.name) + ", " + left.name, files, 0, one.what});
+                       {std::string(one.name) + ", " + left.name, files, 0, one.what, one.answer});
         }
     }
     for (const auto &[one, state] : crashed)

@@ -2,6 +2,7 @@
 #include "tests/long/faults/proof.h"
 
 #include <cstdio>
+#include <filesystem>
 #include <fstream>
 
 static bool read_number(const char *text, guint64 *out_number) {
@@ -15,7 +16,8 @@ static bool read_words(int count, char **words, proof_options *out_options) {
         if (name == "--amount" && read_number(words[i + 1], &out_options->amount))
             has_amount = out_options->amount > 0;
         else if (name == "--figures")
-            out_options->figures = words[i + 1];
+            // The proofs work in a folder of their own.
+            out_options->figures = std::filesystem::absolute(words[i + 1]);
         else if (name != "--seed" || !read_number(words[i + 1], &out_options->seed))
             return false;
     }
