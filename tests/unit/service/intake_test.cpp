@@ -1,174 +1,12 @@
 // tests/unit/service/intake_test.cpp: which calls get a place, and when they give it back.
-//
-// The service's end of a connection of two ends in this process. Calls wait for as long as the test
-// does not run the main loop, since GDBus reads them in its own thread.
 #include <gtest/gtest.h>
-#include <sys/socket.h>
 
-#include <map>
 #include <string>
 #include <vector>
 
 #include <gio/gio.h>
 
-#include "service/intake.h"
-
-static constexpr const char *PATH = "/test";
-static constexpr const char *INTERFACE_XML =
-    "<node><interface name='test.Interface'>"
-    "<method name='Take'><arg type='s' direction='in'/></method>"
-    "<method name='TakeList'><arg type='as' direction='in'/></method>"
-    "</interface></node>";
-static constexpr const char *LIMITS_EXCEEDED = "org.freedesktop.DBus.Error.LimitsExceeded: ";
-static constexpr const char *TOO_MANY =
-    "org.freedesktop.DBus.Error.LimitsExceeded: Too many calls are waiting";
-
-static void on_connected(GObject *, GAsyncResult *result, gpointer slot) {
-    *static_cast<GDBusConnection **>(slot) = g_dbus_connection_new_finish(result, nullptr);
-}
-
-static void start_end(int fd, GDBusConnectionFlags flags, const char *guid,
-                      GDBusConnection **slot) {
-    g_autoptr(GSocket) socket = g_socket_new_from_fd(fd, nullptr);
-    g_autoptr(GSocketConnection) stream = g_socket_connection_factory_create_connection(socket);
-    g_dbus_connection_new(G_IO_STREAM(stream), guid, flags, nullptr, nullptr, on_connected, slot);
-}
-
-class Intake : public ::testing::Test {
-  protected:
-    void SetUp() override {
-        int ends[2] = {-1, -1};
-        ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
-        g_autofree char *guid = g_dbus_generate_guid();
-        start_end(ends[0], G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_SERVER, guid, &server_);
-        start_end(ends[1], G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_CLIENT, nullptr, &client_);
-        while (server_ == nullptr || client_ == nullptr)
-            (void)g_main_context_iteration(nullptr, TRUE);
-
-        info_ = g_dbus_node_info_new_for_xml(INTERFACE_XML, nullptr);
-        intake_guard(server_, PATH, info_->interfaces[0]);
-        static constexpr GDBusInterfaceVTable vtable = {serve, nullptr, nullptr, {}};
-        ASSERT_NE(g_dbus_connection_register_object(server_, PATH, info_->interfaces[0], &vtable,
-                                                    this, nullptr, nullptr),
-                  0U);
-        g_dbus_connection_add_filter(client_, listen, this, nullptr);
-    }
-
-    void TearDown() override {
-        for (GDBusMessage *message : kept_)
-            g_object_unref(message);
-        (void)g_dbus_connection_close_sync(client_, nullptr, nullptr);
-        (void)g_dbus_connection_close_sync(server_, nullptr, nullptr);
-        g_object_unref(client_);
-        g_object_unref(server_);
-        g_dbus_node_info_unref(info_);
-    }
-
-    // Sends a call of Take, or of TakeList for a list, under a sender's name; returns its number.
-    guint32 send(const char *sender, GVariant *arguments, bool silent = false,
-                 const char *path = PATH) {
-        const bool is_list = g_variant_is_of_type(arguments, G_VARIANT_TYPE("(as)")) != FALSE;
-        g_autoptr(GDBusMessage) message = g_dbus_message_new_method_call(
-            nullptr, path, "test.Interface", is_list ? "TakeList" : "Take");
-        g_dbus_message_set_sender(message, sender);
-        g_dbus_message_set_body(message, arguments);
-        if (silent)
-            g_dbus_message_set_flags(message, G_DBUS_MESSAGE_FLAGS_NO_REPLY_EXPECTED);
-        volatile guint32 serial = 0;
-        EXPECT_TRUE(g_dbus_connection_send_message(client_, message, G_DBUS_SEND_MESSAGE_FLAGS_NONE,
-                                                   &serial, nullptr));
-        return serial;
-    }
-
-    guint32 send_small(const char *sender, bool silent = false) {
-        return send(sender, g_variant_new("(s)", "x"), silent);
-    }
-
-    // A text that makes the arguments as costly as that.
-    static GVariant *text_of_cost(gsize cost) {
-        return g_variant_new("(s)", std::string(cost - 1, 'x').c_str());
-    }
-
-    static GVariant *list_of(gsize elements) {
-        std::vector<const char *> list(elements, "");
-        list.push_back(nullptr);
-        return g_variant_new("(^as)", list.data());
-    }
-
-    // Everything sent has passed the filter, since this has; it is answered by GDBus's thread.
-    void settle() {
-        g_autoptr(GDBusMessage) ping =
-            g_dbus_message_new_method_call(nullptr, PATH, "org.freedesktop.DBus.Peer", "Ping");
-        g_dbus_message_set_sender(ping, (":settler." + std::to_string(settled_++)).c_str());
-        g_autoptr(GDBusMessage) answer = g_dbus_connection_send_message_with_reply_sync(
-            client_, ping, G_DBUS_SEND_MESSAGE_FLAGS_NONE, -1, nullptr, nullptr, nullptr);
-        ASSERT_NE(answer, nullptr);
-    }
-
-    // What the call was answered until now: "", "done", or the error and its text.
-    std::string answer_to(guint32 serial) {
-        settle();
-        g_mutex_lock(&lock_);
-        const std::string answer = answers_[serial];
-        g_mutex_unlock(&lock_);
-        return answer;
-    }
-
-    // The main loop comes to all that waits.
-    void serve_all() {
-        settle();
-        while (g_main_context_iteration(nullptr, FALSE) != FALSE) {
-        }
-        settle();
-    }
-
-    // Fills the shared places with calls of so many senders.
-    void fill_shared_places() {
-        for (guint i = 0; i < INTAKE_SHARED_CALLS; i++)
-            (void)send_small((":flooder." + std::to_string(i / INTAKE_SENDER_CALLS)).c_str());
-        settle();
-    }
-
-    guint served_ = 0;
-    bool keeps_messages_ = false;
-    GDBusConnection *server_ = nullptr;
-    GDBusConnection *client_ = nullptr;
-
-  private:
-    static void serve(GDBusConnection *, const char *, const char *, const char *, const char *,
-                      GVariant *, GDBusMethodInvocation *call, gpointer self) {
-        auto *test = static_cast<Intake *>(self);
-        test->served_++;
-        if (test->keeps_messages_)
-            test->kept_.push_back(
-                G_DBUS_MESSAGE(g_object_ref(g_dbus_method_invocation_get_message(call))));
-        g_dbus_method_invocation_return_value(call, nullptr);
-    }
-
-    // Runs in GDBus's thread.
-    static GDBusMessage *listen(GDBusConnection *, GDBusMessage *message, gboolean incoming,
-                                gpointer data) {
-        auto *self = static_cast<Intake *>(data);
-        if (incoming == FALSE)
-            return message;
-        std::string answer = "done";
-        if (g_dbus_message_get_message_type(message) == G_DBUS_MESSAGE_TYPE_ERROR) {
-            const char *text = nullptr;
-            g_variant_get(g_dbus_message_get_body(message), "(&s)", &text);
-            answer = std::string(g_dbus_message_get_error_name(message)) + ": " + text;
-        }
-        g_mutex_lock(&self->lock_);
-        self->answers_[g_dbus_message_get_reply_serial(message)] = answer;
-        g_mutex_unlock(&self->lock_);
-        return message;
-    }
-
-    std::vector<GDBusMessage *> kept_;
-    GDBusNodeInfo *info_ = nullptr;
-    GMutex lock_ = {};
-    std::map<guint32, std::string> answers_;
-    guint settled_ = 0;
-};
+#include "tests/unit/service/intake_ends.h"
 
 TEST_F(Intake, CallIsServedAndAnswered) {
     const guint32 call = send_small(":1.1");
@@ -284,15 +122,39 @@ TEST_F(Intake, LargeCallsOfManyLeaveRoomForSmallOnes) {
     EXPECT_EQ(answer_to(small), "done");
 }
 
+// The call that is held keeps the sender's share from being forgotten.
+TEST_F(Intake, AnsweredCallsGiveTheirSendersCostBack) {
+    holds_calls_ = true;
+    const guint32 held = send(":1.1", text_of_cost(1));
+    serve_all();
+    holds_calls_ = false;
+    for (int round = 0; round < 5; round++) {
+        const guint32 large = send(":1.1", text_of_cost(INTAKE_SENDER_COST - 1));
+        serve_all();
+        EXPECT_EQ(answer_to(large), "done");
+    }
+    EXPECT_EQ(answer_to(held), "");
+}
+
+TEST_F(Intake, AnsweredCallsGiveTheSharedCostBack) {
+    for (int round = 0; round < 5; round++) {
+        std::vector<guint32> taken;
+        for (gsize i = 0; i < INTAKE_SHARED_COST / INTAKE_CALL_COST; i++)
+            taken.push_back(
+                send((":1." + std::to_string(i)).c_str(), text_of_cost(INTAKE_CALL_COST)));
+        serve_all();
+        for (const guint32 call : taken)
+            EXPECT_EQ(answer_to(call), "done");
+    }
+}
+
 TEST_F(Intake, WhoWantsNoAnswerGetsNone) {
     const guint32 large = send(":1.1", text_of_cost(INTAKE_CALL_COST + 1), true);
-    const guint32 elsewhere = send(":1.1", g_variant_new("(s)", "x"), true, "/elsewhere");
-    const guint32 wrong = send(":1.1", g_variant_new("(u)", 1), true);
     for (guint i = 0; i < INTAKE_SENDER_CALLS; i++)
         (void)send_small(":1.1", true);
     const guint32 too_many = send_small(":1.1", true);
     serve_all();
-    for (const guint32 call : {large, elsewhere, wrong, too_many})
+    for (const guint32 call : {large, too_many})
         EXPECT_EQ(answer_to(call), "");
     EXPECT_EQ(served_, INTAKE_SENDER_CALLS);
 }
@@ -311,10 +173,60 @@ TEST_F(Intake, CallUnderTheNumberOfOneThatWaitsIsDropped) {
     EXPECT_EQ(served_, 2U);
 }
 
+// Calls that GDBus answers without the service; the answer is how it begins.
+struct foreign_call {
+    const char *name;
+    const char *path;
+    const char *interface;
+    const char *member;
+    const char *arguments;
+    const char *answer;
+};
+
+static constexpr const char *UNKNOWN_METHOD = "org.freedesktop.DBus.Error.UnknownMethod: ";
+static constexpr const char *INVALID_ARGUMENTS = "org.freedesktop.DBus.Error.InvalidArgs: ";
+static constexpr const char *OURS = "test.Interface";
+static constexpr const char *PROPERTIES = "org.freedesktop.DBus.Properties";
+static constexpr const char *INTROSPECTABLE = "org.freedesktop.DBus.Introspectable";
+static constexpr const char *PEER = "org.freedesktop.DBus.Peer";
+
+static constexpr foreign_call foreign_calls[] = {
+    {"path",          "/elsewhere", OURS,           "Take",       "('x',)",                  UNKNOWN_METHOD   },
+    {"interface",     PATH,         "test.Other",   "Take",       "('x',)",                  UNKNOWN_METHOD   },
+    {"method",        PATH,         OURS,           "Give",       "('x',)",                  UNKNOWN_METHOD   },
+    {"signature",     PATH,         OURS,           "Take",       "(1,)",                    INVALID_ARGUMENTS},
+    {"no interface",  PATH,         nullptr,        "Take",       "('x',)",                  UNKNOWN_METHOD   },
+    {"property",      PATH,         PROPERTIES,     "Get",        "('test.Interface', 'X')", INVALID_ARGUMENTS},
+    {"properties",    PATH,         PROPERTIES,     "GetAll",     "('test.Interface',)",     "done"           },
+    {"introspection", PATH,         INTROSPECTABLE, "Introspect", "()",                      "done"           },
+    {"ping",          PATH,         PEER,           "Ping",       "()",                      "done"           },
+};
+
 TEST_F(Intake, CallsThatGdbusAnswersGiveTheirPlacesBack) {
-    for (guint i = 0; i < 3 * INTAKE_CALLS; i++) {
-        const guint32 call = send(":1.1", g_variant_new("(s)", "x"), false, "/elsewhere");
-        ASSERT_EQ(answer_to(call).rfind("org.freedesktop.DBus.Error.UnknownMethod: ", 0), 0U);
+    for (const foreign_call &one : foreign_calls) {
+        SCOPED_TRACE(one.name);
+        for (guint i = 0; i < 3 * INTAKE_SENDER_CALLS; i++) {
+            const guint32 call = send_to(one.path, one.interface, one.member, ":1.1",
+                                         g_variant_new_parsed(one.arguments), false);
+            serve_all();
+            ASSERT_EQ(answer_to(call).rfind(one.answer, 0), 0U) << answer_to(call);
+        }
+    }
+}
+
+// The last call has the place that any of them would have held.
+TEST_F(Intake, CallsThatGdbusAnswersAreDroppedWhenTheyWantNoAnswer) {
+    for (const foreign_call &one : foreign_calls) {
+        SCOPED_TRACE(one.name);
+        std::vector<guint32> calls;
+        for (guint i = 0; i < INTAKE_SENDER_CALLS; i++)
+            calls.push_back(send_to(one.path, one.interface, one.member, ":1.1",
+                                    g_variant_new_parsed(one.arguments), true));
+        const guint32 last = send_small(":1.1");
+        serve_all();
+        for (const guint32 call : calls)
+            EXPECT_EQ(answer_to(call), "");
+        EXPECT_EQ(answer_to(last), "done");
     }
 }
 
