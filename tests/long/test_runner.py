@@ -47,12 +47,13 @@ def test_a_proof_gets_its_amount_and_seed_and_reports() -> None:
     "count(points=7, failures=1)",
     "count(points=7)",
     "count(points=0, failures=0)",
+    "count(points=6, failures=0)",
     "count(failures=0)",
     "told.figures.write_text('[]')",
     "told.figures.write_text('{')",
     "",
 ])
-def test_a_proof_that_failed_or_counted_nothing_has_not_passed(text: str) -> None:
+def test_a_proof_that_failed_or_counted_too_little_has_not_passed(text: str) -> None:
     assert not proofs.run(proof_of(text), 7, 3).passed
 
 
