@@ -21,6 +21,8 @@ OUTPUT = ("write", "pwrite64", "writev", "pwritev", "sendfile", "socket", "conne
 
 # The service ignores it, and strace tells of it.
 MARK = signal.SIGURG
+# Other proofs may keep the machine busy.
+MARK_SECONDS = 30.0
 
 # A thread of GLib's, and the wake-up of a loop in another thread.
 THREAD = re.compile(r"clone3?\(.*CLONE_THREAD")
@@ -43,7 +45,7 @@ class EffectsTrace(Attached):
     def since_last(self) -> list[str]:
         """What was begun up to now."""
         os.kill(self._service, MARK)
-        wait_for("the mark in the trace", self._is_marked)
+        wait_for("the mark in the trace", self._is_marked, MARK_SECONDS)
         with self._output.open("rb") as trace:
             trace.seek(self._read)
             lines = trace.read().splitlines(keepends=True)
