@@ -24,7 +24,7 @@ def faults_in(left: Version, changes: Sequence[Change], answered: int, begun: in
     """What is wrong; nothing when all is well."""
     allowed = allowed_versions(changes, answered, begun)
     if left in allowed:
-        return []
+        return _modes_not_kept(left, changes[0].version)
     faults = []
     for name in FILES:
         if all(left[name] != version[name] for version in allowed):
@@ -32,6 +32,13 @@ def faults_in(left: Version, changes: Sequence[Change], answered: int, begun: in
     return faults or ["each file is old or new, but they were not replaced in their order: "
                       + ", ".join(f"{name} of {_versions_with(name, left, changes)}"
                                   for name in changes[begun].written)]
+
+
+def _modes_not_kept(left: Version, first: Version) -> list[str]:
+    """The files are compared with those that were read while all was well, and so would be wrong
+    together with them; a file keeps the mode it had before anything was changed."""
+    return [f"{name} has mode {file[0]:o}, and had {old[0]:o}" for name, file in left.items()
+            if file is not None and (old := first[name]) is not None and file[0] != old[0]]
 
 
 def _versions_with(name: str, left: Version, changes: Sequence[Change]) -> list[int]:

@@ -9,6 +9,8 @@ from write_log import FUA, FLUSH, Entry
 METADATA = 16
 SECTOR, BLOCK = 512, 4096
 IN_VAIN = 30
+# This part of the amount.
+LEAST_SUBSETS = 5
 
 
 @dataclass(frozen=True)
@@ -91,13 +93,11 @@ def _unit(entry: Entry) -> int:
 
 
 def choose(entries: Sequence[Entry], start: int, amount: int, seed: str) -> list[State]:
-    """Every prefix, if they are not more than two thirds, and subsets for the rest; ordered by
-    where they begin."""
+    """Every prefix, also where they are more than the amount, and subsets for the rest, which is a
+    fifth of the amount at least; ordered by where they begin."""
     chosen = prefixes(entries, start)
-    most = max(1, amount * 2 // 3)
-    if len(chosen) > most:
-        chosen = random.Random(seed).sample(chosen, most)
-    chosen += subsets(entries, start, amount - len(chosen), seed)
+    rest = max(amount - len(chosen), amount // LEAST_SUBSETS)
+    chosen += subsets(entries, start, rest, seed)
     return sorted(chosen, key=lambda state: state.base)
 
 

@@ -13,6 +13,11 @@ CLEARING_ORDER = ("shadow", "passwd", "group", "digest", "parameters", "boot")
 EXISTING_GROUPS = ("video", "audio", "games", "plugdev")
 LETTERS = "abcdefghijklmnopqrstuvwxyz"
 
+# The least are one of every kind; the most are what a recording is kept short with.
+LEAST_CHANGES, MOST_CHANGES = 20, 40
+# As measured: the changes of accounts write most of it to the journal.
+WRITES_OF_A_CHANGE = 50
+
 
 @dataclass(frozen=True)
 class Step:
@@ -45,7 +50,8 @@ class Planner:
             self._modify_comment, self._modify_groups, self._set_root_password,
             self._set_boot_parameter, self._set_digest, self._chpasswd, self._clear_system_user,
             self._clear_user, self._add_uid_user, self._remove_user, self._delete_digest,
-            self._remove_group, self._remove_system_user, self._refused]
+            self._remove_group, self._remove_system_user, self._set_boot_parameter,
+            self._set_boot_parameter, self._refused]
         # Changes come more often than what is refused; the rest is for chance alone.
         others = [*kinds[:-1], self._add_user, self._modify_all, self._modify_all,
                   self._set_boot_parameter, self._set_boot_parameter, self._set_digest]
@@ -184,6 +190,12 @@ class Planner:
         if self._random.random() < 0.3:
             return Step(f"pause {self._random.randint(1, 400)}")
         return Step(f"write other-{self._random.randint(1, 5)} {self._random.randint(1, 20000)}")
+
+
+def changes_for(states: int) -> int:
+    """So many that the disk after each of their writes is about two thirds of the states."""
+    changes = states * 2 // 3 // WRITES_OF_A_CHANGE
+    return min(max(changes, LEAST_CHANGES), MOST_CHANGES)
 
 
 def call(method: str, *arguments: str | list[str], succeeds: bool = True) -> Step:

@@ -29,7 +29,6 @@ from camera.storage_disk import BOOT_BLOCK_START  # noqa: E402
 from camera.storage_disk import DISK_SIZE as STORAGE_SIZE  # noqa: E402
 from camera.warm_start import start_camera  # noqa: E402
 
-CHANGES = 40
 KEPT = 8
 SECTOR = 512
 CALL_SECONDS = 300
@@ -102,17 +101,17 @@ class Recordings:
         self._folder = self._build / "power-cuts"
         self._folder.mkdir(exist_ok=True)
 
-    def get(self, file_system: str, seed: int, anew: bool) -> RecordedRun:
+    def get(self, file_system: str, seed: int, changes: int, anew: bool) -> RecordedRun:
         """The one of this seed and this product, recorded if it is not there."""
-        folder = self._folder / f"{file_system}-{seed}-{self._key()}"
+        folder = self._folder / f"{file_system}-{seed}-{changes}-{self._key()}"
         with (self._folder / "lock").open("w") as lock:
             fcntl.flock(lock, fcntl.LOCK_EX)
             if anew:
                 shutil.rmtree(folder, ignore_errors=True)
             if not folder.exists():
                 self._forget_old()
-                self._say(f"{file_system}: recording {CHANGES} changes in the camera")
-                self._record(folder, file_system, seed)
+                self._say(f"{file_system}: recording {changes} changes in the camera")
+                self._record(folder, file_system, seed, changes)
         return RecordedRun(folder)
 
     def keep(self, run: RecordedRun) -> None:
@@ -133,8 +132,8 @@ class Recordings:
         for folder in kept[KEPT - 1:]:
             shutil.rmtree(folder)
 
-    def _record(self, folder: Path, file_system: str, seed: int) -> None:
-        steps = Planner(f"{file_system} {seed}").steps(CHANGES)
+    def _record(self, folder: Path, file_system: str, seed: int, changes: int) -> None:
+        steps = Planner(f"{file_system} {seed}").steps(changes)
         work = Path(tempfile.mkdtemp(prefix="making-", dir=self._folder))
         try:
             (work / STEPS).write_text(json.dumps([asdict(step) for step in steps], indent=1))

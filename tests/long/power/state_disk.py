@@ -8,19 +8,18 @@ from pathlib import Path
 from boot_copies import COPY_SIZE, active_parameters
 from cut_states import State
 from recorded_run import BOOT_BLOCK_SIZE, DISK_SIZE, FILE_SYSTEM_SIZE, File, RecordedRun, Version
+from recovery import faults_of_recovery
 
 PATHS = {
     "passwd": "/etc/passwd", "shadow": "/etc/shadow", "group": "/etc/group",
     "digest": "/etc/apache2/digest_auth_passwd", "parameters": "/etc/privane/parameters.conf"}
-# What e2fsck answers when nothing is left to do.
-CLEAN, CORRECTED = 0, 1
 TOOL_SECONDS = 60
 ENVIRONMENT = {**os.environ, "PATH": os.environ.get("PATH", os.defpath) + ":/usr/sbin:/sbin",
                "LC_ALL": "C"}
 
 
 class BrokenFileSystem(Exception):
-    """It cannot be mounted any more."""
+    """It cannot be mounted any more, or is not in order after its recovery."""
 
 
 class StateDisk:
@@ -75,10 +74,10 @@ class StateDisk:
 
     def _recover(self) -> None:
         """Replays the journal, as mounting would, and looks whether all is in order then."""
-        done = _tool("e2fsck", "-f", "-p", self._path)
-        if done.returncode not in (CLEAN, CORRECTED):
-            raise BrokenFileSystem(f"e2fsck: status {done.returncode}: "
-                                   f"{(done.stdout + done.stderr).decode(errors='replace')[-600:]}")
+        # With -p, it would repair some of what it finds without a word.
+        done = _tool("e2fsck", "-f", "-y", self._path)
+        if faults := faults_of_recovery(done.returncode, done.stdout + done.stderr):
+            raise BrokenFileSystem(f"e2fsck: {'; '.join(faults)[:600]}")
 
     def _read_files(self) -> Version:
         done = _tool("debugfs", "-f", self._commands, self._path)

@@ -70,6 +70,16 @@ def test_mode_and_owner_are_the_files_own() -> None:
         assert "has its content, but mode" in fault
 
 
+def test_a_mode_that_was_always_wrong() -> None:
+    """The service changed it itself, and was seen with it while all was well; the owner may
+    change."""
+    for access, faults in (((0o666, 0, 0), ["shadow has mode 666, and had 644"]),
+                           ((0o644, 0, 42), [])):
+        left: Version = {**NEW, "shadow": (*access, b"shadow 2\n")}
+        changes = [*CHANGES[:2], Change("ModifyUser", left, ACCOUNTS)]
+        assert faults_in(left, changes, 2, 2) == faults
+
+
 def test_no_valid_boot_block() -> None:
     assert faults_in({**OLD, "boot": None}, CHANGES, 1, 2) == ["boot has no valid copy"]
 

@@ -57,6 +57,10 @@ def test_the_same_seed_chooses_the_same() -> None:
     assert [state.base for state in chosen] == sorted(state.base for state in chosen)
 
 
-def test_a_small_amount_has_of_both() -> None:
-    chosen = choose(entries(), 0, 6, "1")
-    assert [sum(1 for state in chosen if state.extra), len(chosen)] == [2, 6]
+def test_no_prefix_is_left_out_of_a_small_amount() -> None:
+    every = set(prefixes(entries(), 0))
+    assert len(every) == 6
+    for amount, subsets_of_it in ((1, 0), (5, 1), (6, 1), (8, 2), (10, 4)):
+        chosen = choose(entries(), 0, amount, "1")
+        assert every <= set(chosen)
+        assert len(chosen) == 6 + subsets_of_it

@@ -41,10 +41,14 @@ def disk_image(tmp_path_factory: pytest.TempPathFactory) -> bytes:
 @pytest.fixture
 def disk(disk_image: bytes, tmp_path: Path) -> StateDisk:
     new = boot_copy(2, b"B=" + b"2" * 1000 + b"\0")
-    log = made_log(written(0, disk_image), written(FILE_SYSTEM_SIZE, boot_copy(1, b"A=1\0")),
+    return disk_of(tmp_path, written(0, disk_image),
+                   written(FILE_SYSTEM_SIZE, boot_copy(1, b"A=1\0")),
                    marked("start-0"), written(FILE_SYSTEM_SIZE + COPY_SIZE, new),
                    written(0, b"\0" * 8192), written(0, b"", FLUSH))
-    (tmp_path / LOG).write_bytes(log)
+
+
+def disk_of(tmp_path: Path, *entries: bytes) -> StateDisk:
+    (tmp_path / LOG).write_bytes(made_log(*entries))
     (tmp_path / STEPS).write_text(json.dumps([]))
     (tmp_path / ANSWERS).write_text("")
     return StateDisk(RecordedRun(tmp_path), tmp_path)
@@ -89,6 +93,33 @@ def test_nothing_stays_of_the_state_before(tmp_path: Path) -> None:
 def test_a_file_system_that_is_lost(disk: StateDisk) -> None:
     with pytest.raises(BrokenFileSystem):
         disk.left_by(state(5))
+
+
+@pytest.mark.parametrize(("commands", "fault"), [
+    (["stat /"], None),
+    (["ssv free_blocks_count 7", "ssv free_inodes_count 7"], None),
+    (["set_bg 0 free_blocks_count 7", "set_bg 0 checksum calc"], "for group #0"),
+    (["set_bg 0 free_inodes_count 7", "set_bg 0 checksum calc"], "for group #0"),
+    (["sif /etc/passwd links_count 2"], "ref count is 2, should be 1"),
+    (["unlink /etc/group"], "zero-length inode"),
+    (["unlink /etc/shadow"], "Unattached inode"),
+    (["clri /etc/shadow"], "'shadow' in /etc")])
+def test_a_file_system_that_is_not_in_order(commands: list[str], fault: str | None,
+                                            disk_image: bytes, tmp_path: Path) -> None:
+    """With -p, e2fsck would repair most of these and answer as after a recovery, one of them
+    without a word."""
+    image = tmp_path / "image"
+    image.write_bytes(disk_image)
+    for command in commands:
+        subprocess.run(["debugfs", "-w", "-R", command, image], env=ENVIRONMENT, check=True,
+                       capture_output=True)
+    damaged = disk_of(tmp_path, written(0, image.read_bytes()), marked("start-0"),
+                      written(0, b"", FLUSH))
+    if fault is None:
+        assert damaged.left_by(state(2))["passwd"] is not None
+    else:
+        with pytest.raises(BrokenFileSystem, match=fault):
+            damaged.left_by(state(2))
 
 
 def test_the_boot_copy_that_counts() -> None:
