@@ -6,17 +6,24 @@
 # its bindings read-only before it starts, and check its stack frames; and the checked functions of
 # the C library must be in use wherever the file calls one that has them at a size the compiler knows.
 # That no file was compiled without the options, which a file may do and not show it, the commands
-# tell.
+# tell; and its object file, that where its indirect calls and returns land is checked, if the
+# machine has such checks.
 import json
 import re
 import subprocess
 import sys
 from pathlib import Path
 
-OPTIONS = ["-fstack-protector-strong", "-fstack-clash-protection", "-fcf-protection",
-           "-D_FORTIFY_SOURCE=2"]
+OPTIONS = ["-fstack-protector-strong", "-fstack-clash-protection", "-D_FORTIFY_SOURCE=2"]
 OPTIMIZED = re.compile(r" -O(1|2|3|s|g)\b")
 FOLDERS = ("service", "methods", "usermgmt", "platform")
+
+# What -fcf-protection and -mbranch-protection add to an object file. The second is for who builds
+# the product: machines before ARMv8.3 know none of it.
+X86 = ("Advanced Micro Devices X86-64", "Intel 80386")
+X86_FEATURES = {"IBT", "SHSTK"}
+AARCH64 = "AArch64"
+AARCH64_FEATURES = {"standard": {"BTI", "PAC"}, "bti": {"BTI"}, "pac-ret": {"PAC"}}
 
 # The checked functions that a file imports; those left out have no use for one.
 FORTIFIED = {
@@ -65,7 +72,37 @@ def faults_of_file(path, is_program):
         yield f"does not import {name}"
 
 
-def faults_of_commands(path):
+def machine_of(path):
+    return re.search(r"Machine: +(.*)", output_of("readelf", "-hW", path))[1].strip()
+
+
+def features_of(path):
+    """The checks of jumps that an object file is prepared for, by its property."""
+    told = re.search(r"feature: (.*)", output_of("readelf", "-nW", path))
+    return set(told[1].strip().split(", ")) if told else set()
+
+
+def features_asked(machine, command):
+    """Those that a file compiled for the machine by this command has to have."""
+    if machine in X86:
+        return X86_FEATURES
+    asked = re.findall(r" -mbranch-protection=(\S+)", command)
+    if machine != AARCH64 or not asked:
+        return set()
+    words = asked[-1].split("+")
+    return set().union(*(AARCH64_FEATURES.get(word, set()) for word in words))
+
+
+def faults_of_features(machine, commands):
+    """Of the object files that the commands, by the files, have made."""
+    asked = {path: features_asked(machine, command) for path, command in commands.items()}
+    of_all = set().union(*asked.values())
+    for path in commands:
+        if missing := of_all - features_of(path):
+            yield f"{path}: no {', '.join(sorted(missing))}"
+
+
+def faults_of_commands(path, machine):
     """Of what goes into the product, which is what does not belong to the tests."""
     with open(path, encoding="utf-8") as file:
         commands = json.load(file)
@@ -78,15 +115,19 @@ def faults_of_commands(path):
         missing = [option for option in OPTIONS if f" {option} " not in command]
         if not OPTIMIZED.search(command):
             missing.append("-O")
+        if machine in X86 and " -fcf-protection " not in command:
+            missing.append("-fcf-protection")
         if "-fno-stack-protector" in command or command.count("_FORTIFY_SOURCE=") != 1:
             missing.append("nothing against them")
         if missing:
             yield f"{entry['output']}: compiled without {', '.join(missing)}"
+    yield from faults_of_features(machine, {Path(entry["directory"]) / entry["output"]:
+                                            entry["command"] for entry in product})
 
 
 def main():
     commands, program, *libraries = sys.argv[1:]
-    faults = list(faults_of_commands(commands))
+    faults = list(faults_of_commands(commands, machine_of(program)))
     for path in (program, *libraries):
         faults += [f"{path}: {fault}" for fault in faults_of_file(path, path == program)]
     for fault in faults:
