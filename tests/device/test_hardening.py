@@ -1,4 +1,5 @@
 """tests/device/test_hardening.py: what the unit takes from the service, and that nothing misses it."""
+import errno
 import re
 
 import pytest
@@ -7,6 +8,7 @@ from camera import system_tour
 from camera.machine import Camera
 from camera.tour import METHODS, NAME, UNIT, Tour, call
 from camera.transcript import Transcript
+from denied_calls import DeniedCalls, Refusal
 from drop_in import install_drop_in, unit_properties
 
 MOST_EXPOSURE = 3.5
@@ -19,12 +21,30 @@ STRICT = "[Service]\nSystemCallErrorNumber=kill\nSystemCallFilter=sched_setattr\
 # refused, and of a process that came to an end by it.
 DENIALS = r"type=1326|type=14\d\d|apparmor=\"DENIED\"|denied|segfault|traps:"
 
+# What a program may try in vain, and how each is refused: by capability, device rule, hidden
+# device, port, read-only mount, and address family.
+PERL = "/usr/bin/perl"
+ATTEMPTS: dict[str, Refusal] = {
+    '$path = "/etc/null"; syscall(133, $path, 020600, 0x103)': (PERL, 133, errno.EPERM),
+    'open F, "/dev/vda"': (PERL, 257, errno.EPERM),
+    'open F, "/dev/kmsg"': (PERL, 257, errno.EACCES),
+    '$to = pack("S n N x8", 2, 81, 0); syscall(49, syscall(41, 2, 1, 0), $to, 16)':
+        (PERL, 49, errno.EACCES),
+    'open F, ">/usr/made"': (PERL, 257, errno.EROFS),
+    "syscall(41, 10, 1, 0)": (PERL, 41, errno.EAFNOSUPPORT),
+}
+
 RECORDING_SYSFLASH = b"#!/bin/sh\necho $2 >>/var/lib/sysflash/resets\n"
 
 
 @pytest.fixture
-def strict(camera: Camera) -> Camera:
-    """A camera whose service may not even try."""
+def denied(camera: Camera) -> DeniedCalls:
+    return DeniedCalls(camera)
+
+
+@pytest.fixture
+def strict(camera: Camera, denied: DeniedCalls) -> Camera:
+    """A camera whose service may not even try; all that it is refused is recorded."""
     install_drop_in(camera, "strict.conf", STRICT)
     return camera
 
@@ -53,7 +73,7 @@ def reset_without_a_reboot(show: Transcript) -> None:
 
 
 def test_all_methods_do_their_work_and_try_nothing_that_is_denied(
-        strict: Camera, monkeypatch: pytest.MonkeyPatch) -> None:
+        strict: Camera, denied: DeniedCalls, monkeypatch: pytest.MonkeyPatch) -> None:
     monkeypatch.setattr(system_tour, "_show_reboot", reset_without_a_reboot)
     lines: list[str] = []
     Tour(strict, lines.append, bold=False).walk()
@@ -61,6 +81,9 @@ def test_all_methods_do_their_work_and_try_nothing_that_is_denied(
     assert len(called) == METHODS
     assert "strict.conf" in unit_properties(strict, "DropInPaths")["DropInPaths"]
     assert denials(strict) == []
+    # That these are all shows that the tour was refused nothing, and that it was recorded.
+    try_all(strict)
+    assert denied.of_service() == set(ATTEMPTS.values())
 
 
 @pytest.mark.parametrize("attempt", [
@@ -73,6 +96,27 @@ def test_a_denial_is_seen(strict: Camera, attempt: str) -> None:
     assert denials(strict) == []
     ask(strict, "Reboot")
     assert [line for line in denials(strict) if 'comm="perl"' in line and "type=1326" in line]
+
+
+def try_all(camera: Camera) -> None:
+    """Through the service, in a tool that it runs. Perl wants variables, not literals."""
+    lines = "\n".join(f"perl -e '{attempt}'" for attempt in ATTEMPTS)
+    camera.put_file("/usr/sbin/sysflash", f"#!/bin/sh\n{lines}\n".encode(), 0o755)
+    ask(camera, "Reboot")
+
+
+def test_refusals_that_a_program_lives_through_are_seen(
+        strict: Camera, denied: DeniedCalls) -> None:
+    assert denied.of_service() == set()
+    try_all(strict)
+    assert denied.of_service() == set(ATTEMPTS.values())
+    assert denials(strict) == []
+
+
+def test_what_another_service_is_refused_is_not_ours(strict: Camera, denied: DeniedCalls) -> None:
+    strict.run(["systemd-run", "--wait", "-p", "ProtectSystem=strict", "--",
+                "sh", "-c", "! echo >/usr/made"]).check()
+    assert denied.of_service() == set()
 
 
 def test_a_tool_that_is_denied_a_call_is_told_so(camera: Camera) -> None:
