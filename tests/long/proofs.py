@@ -5,12 +5,13 @@ draws everything random from the seed, and writes its counts to FILE as a JSON o
 begin with "max_" are maxima and all others are sums. Exit status 0 tells that nothing failed.
 """
 import json
-import subprocess
 import sys
 import tempfile
 import time
 from dataclasses import dataclass
 from pathlib import Path
+
+from process_groups import ProcessGroups
 
 TREE = Path(__file__).resolve().parents[2]
 
@@ -23,7 +24,8 @@ LEAST_SHARE = 0.9
 @dataclass(frozen=True)
 class Proof:
     """unit is the count by which a proof is measured. gate is the amount of ./test proof, step that
-    of one start in a long run, aim what one night should reach, and full what many should."""
+    of one start in a long run, aim what one night should reach, and full what many should. patience
+    is how many seconds a unit may take, several times what it does on two busy cores."""
 
     name: str
     command: tuple[str, ...]
@@ -32,9 +34,16 @@ class Proof:
     step: int
     aim: int
     full: int
+    patience: float
     build: str = "build"
     # A proof that keeps both cores busy, or measures time, has the machine to itself.
     cores: int = 1
+    # Seconds beside those of its units: to make the camera, to record, to start.
+    patience_to_start: float = 600
+
+    def limit(self, amount: int) -> float:
+        """The seconds after which a start of so many units is given up."""
+        return self.patience_to_start + self.patience * amount
 
 
 @dataclass(frozen=True)
@@ -51,29 +60,30 @@ def on_bus(name: str, build: str = "build") -> tuple[str, ...]:
 
 PROOFS: tuple[Proof, ...] = (
     Proof("kill_points", ("build/tests/long/faults/kill_points",), "points",
-          gate=12_000, step=50_000, aim=200_000, full=2_000_000),
+          gate=12_000, step=50_000, aim=200_000, full=2_000_000, patience=0.1),
     Proof("failing_calls", ("build/tests/long/faults/failing_calls",), "faults",
-          gate=17_000, step=50_000, aim=200_000, full=2_000_000),
+          gate=17_000, step=50_000, aim=200_000, full=2_000_000, patience=0.1),
     Proof("daemon_kills", on_bus("daemon_kills"), "points",
-          gate=300, step=12_500, aim=12_500, full=25_000),
+          gate=300, step=12_500, aim=12_500, full=25_000, patience=2),
     Proof("power_cuts", ("tests/long/power/power_cuts",), "states",
-          gate=3_000, step=12_000, aim=50_000, full=250_000, cores=2),
+          gate=3_000, step=12_000, aim=50_000, full=250_000, patience=0.1, cores=2),
     Proof("fuzzing", ("tests/fuzz/run",), "seconds",
-          gate=10, step=60, aim=480, full=2_400, build="build-fuzz", cores=2),
+          gate=10, step=60, aim=480, full=2_400, patience=40, build="build-fuzz", cores=2),
     Proof("bus_fuzzing", on_bus("bus_fuzzing", "build-sanitize"), "calls",
-          gate=46_000, step=46_000, aim=460_000, full=1_000_000, build="build-sanitize"),
+          gate=46_000, step=46_000, aim=460_000, full=1_000_000, patience=0.05,
+          build="build-sanitize"),
     Proof("authorization_matrix", on_bus("authorization_matrix"), "cells",
-          gate=368, step=368, aim=1_104, full=3_680),
+          gate=368, step=368, aim=1_104, full=3_680, patience=5),
     Proof("races", on_bus("races"), "trials",
-          gate=5_000, step=5_000, aim=25_000, full=100_000),
+          gate=5_000, step=5_000, aim=25_000, full=100_000, patience=0.2),
     Proof("soak", on_bus("soak"), "seconds",
-          gate=60, step=1_800, aim=1_800, full=28_800),
+          gate=60, step=1_800, aim=1_800, full=28_800, patience=3),
     Proof("flood", on_bus("flood"), "seconds",
-          gate=10, step=60, aim=60, full=600, cores=2),
+          gate=10, step=60, aim=60, full=600, patience=60, cores=2),
     Proof("daemon_secrets", on_bus("daemon_secrets"), "calls",
-          gate=400, step=400, aim=2_000, full=20_000),
+          gate=400, step=400, aim=2_000, full=20_000, patience=3),
     Proof("seeded_defects", ("tests/long/seeded/run",), "defects",
-          gate=8, step=8, aim=8, full=8, cores=2),
+          gate=8, step=8, aim=8, full=8, patience=600, cores=2),
 )
 
 
@@ -84,22 +94,25 @@ def named(names: list[str]) -> list[Proof]:
     return [proof for proof in PROOFS if proof.name in names or not names]
 
 
-def run(proof: Proof, amount: int, seed: int) -> Outcome:
-    """One start of a proof. Counts that are missing, or that count too little, make it fail."""
+def run(proof: Proof, amount: int, seed: int, groups: ProcessGroups | None = None) -> Outcome:
+    """One start of a proof. Counts that are missing, or that count too little, make it fail, and so
+    does taking too long. Raises Stopped when the groups are stopped meanwhile."""
     with tempfile.TemporaryDirectory() as scratch:
-        figures = Path(scratch) / "figures.json"
+        figures, printed = Path(scratch) / "figures.json", Path(scratch) / "printed"
         started = time.monotonic()
         command = [*proof.command, "--amount", str(amount), "--seed", str(seed),
                    "--figures", str(figures)]
-        ended = subprocess.run(command, cwd=TREE, stdin=subprocess.DEVNULL, text=True,
-                               errors="backslashreplace", stdout=subprocess.PIPE,
-                               stderr=subprocess.STDOUT)
+        limit = proof.limit(amount)
+        # Not a pipe: who left the group could hold its other end for ever.
+        with printed.open("wb") as output:
+            status = (groups or ProcessGroups()).run(command, TREE, output, limit)
         seconds = time.monotonic() - started
-        output = f"$ {' '.join(command)}\n{ended.stdout}(exit status {ended.returncode})\n"
+        end = f"took more than {limit:,.0f} s" if status is None else f"exit status {status}"
+        said = printed.read_text(errors="backslashreplace")
         counts = read_counts(figures)
-    passed = (ended.returncode == 0 and counts.get("failures", 1) == 0
+    passed = (status == 0 and counts.get("failures", 1) == 0
               and counts.get(proof.unit, 0) >= LEAST_SHARE * amount)
-    return Outcome(passed, counts, output, seconds)
+    return Outcome(passed, counts, f"$ {' '.join(command)}\n{said}({end})\n", seconds)
 
 
 def read_counts(figures: Path) -> Counts:
@@ -117,8 +130,8 @@ def described(counts: Counts) -> str:
 def build(proofs: list[Proof]) -> None:
     """Brings the build directories of these proofs up to date; ends the program where it cannot."""
     for name in sorted({proof.build for proof in proofs} | {"build"}):
-        ended = subprocess.run(["tools/build", name], cwd=TREE, stdout=subprocess.PIPE,
-                               stderr=subprocess.STDOUT, text=True)
-        if ended.returncode != 0:
-            print(ended.stdout[-4000:], file=sys.stderr)
-            sys.exit(f"{name} does not build")
+        with tempfile.TemporaryFile() as output:
+            if ProcessGroups().run(["tools/build", name], TREE, output) != 0:
+                output.seek(0)
+                print(output.read().decode(errors="replace")[-4000:], file=sys.stderr)
+                sys.exit(f"{name} does not build")

@@ -1,39 +1,16 @@
-"""tests/long/test_runner.py: a proof's figures count, add up, and cannot hide a failure."""
-import json
+"""tests/long/test_runner.py: a proof's figures count, and cannot hide a failure; none runs on."""
 import threading
-from importlib.machinery import SourceFileLoader
-from importlib.util import module_from_spec, spec_from_loader
+import time
 from pathlib import Path
-from types import ModuleType
 
 import pytest
 
+import process_groups
 import proofs
 from lanes import Lanes
-from proofs import Proof
-
-
-def script(name: str) -> ModuleType:
-    """A program of this folder that has no .py in its name."""
-    path = Path(__file__).with_name(name)
-    loader = SourceFileLoader(f"script_{name}", str(path))
-    spec = spec_from_loader(loader.name, loader)
-    assert spec is not None
-    module = module_from_spec(spec)
-    loader.exec_module(module)
-    return module
-
-
-def proof_of(text: str, cores: int = 1, name: str = "sample", aim: int = 100) -> Proof:
-    """A proof that runs this Python text; "amount", "seed" and "figures" are what it was told."""
-    program = ("import argparse, json, pathlib, sys, time\n"
-               "parser = argparse.ArgumentParser()\n"
-               "for word in ('amount', 'seed'): parser.add_argument(f'--{word}', type=int)\n"
-               "parser.add_argument('--figures', type=pathlib.Path)\n"
-               "told = parser.parse_args()\n"
-               "def count(**counts): told.figures.write_text(json.dumps(counts))\n" + text)
-    return Proof(name, ("/usr/bin/python3", "-c", program), "points", gate=5, step=10, aim=aim,
-                 full=10 * aim, cores=cores)
+from process_groups import ProcessGroups
+from proofs import Outcome, Proof
+from samples import SLEEPER, await_end, await_it, proof_of
 
 
 def test_a_proof_gets_its_amount_and_seed_and_reports() -> None:
@@ -70,17 +47,49 @@ def test_every_row_names_a_program_of_the_tree_or_of_its_build() -> None:
         assert 0 < proof.gate and 0 < proof.step and 0 < proof.aim <= proof.full, proof.name
 
 
+def test_every_row_waits_long_enough_and_not_for_ever() -> None:
+    for proof in proofs.PROOFS:
+        assert 600 < proof.limit(proof.gate) <= 8 * 3600, proof.name
+        if proof.unit == "seconds":
+            assert proof.limit(proof.step) > 2 * proof.step, proof.name
+    assert proof_of("").limit(1000) == 70
+
+
+def test_a_proof_that_takes_too_long_is_killed_with_its_group_and_has_failed(
+        monkeypatch: pytest.MonkeyPatch) -> None:
+    monkeypatch.setattr(process_groups, "LAST_SECONDS", 0.5)
+    started = time.monotonic()
+    outcome = proofs.run(proof_of(SLEEPER, patience_to_start=2), 7, 3)
+    assert 2 < time.monotonic() - started < 30
+    assert not outcome.passed
+    assert outcome.counts["points"] == 7
+    assert "(took more than 2 s)" in outcome.output
+    [said] = [line for line in outcome.output.splitlines() if line.startswith("so far")]
+    for pid in said.split()[2:]:
+        await_end(int(pid))
+
+
+def test_what_a_proof_leaves_running_ends_with_it() -> None:
+    text = ("process = subprocess.Popen(['sleep', '600'])\n"
+            "print('left', process.pid)\n"
+            "count(points=7, failures=0)\n")
+    outcome = proofs.run(proof_of(text), 7, 3)
+    assert outcome.passed
+    [pid] = [line.split()[1] for line in outcome.output.splitlines() if line.startswith("left ")]
+    await_end(int(pid))
+
+
 def test_lanes_never_take_more_cores_than_there_are() -> None:
     taken, most, ended = 0, 0, []
     lock = threading.Lock()
     run = proofs.run
 
-    def counting_run(proof: Proof, amount: int, seed: int) -> proofs.Outcome:
+    def counting_run(proof: Proof, amount: int, seed: int, groups: ProcessGroups) -> Outcome:
         nonlocal taken, most
         with lock:
             taken += proof.cores
             most = max(most, taken)
-        outcome = run(proof, amount, seed)
+        outcome = run(proof, amount, seed, groups)
         with lock:
             taken -= proof.cores
         return outcome
@@ -98,53 +107,36 @@ def test_lanes_never_take_more_cores_than_there_are() -> None:
     assert most == 2
 
 
-@pytest.fixture
-def runner(tmp_path: Path, monkeypatch: pytest.MonkeyPatch) -> ModuleType:
-    module = script("run")
-    monkeypatch.setattr(module, "KEPT", tmp_path)
-    return module
+def test_lanes_that_an_exception_leaves_end_what_runs_and_report_nothing(
+        monkeypatch: pytest.MonkeyPatch, tmp_path: Path) -> None:
+    monkeypatch.setattr(process_groups, "LAST_SECONDS", 0.5)
+    pids = tmp_path / "pids"
+    tells = f"pathlib.Path('{pids}').write_text(f'{{os.getpid()}} {{deaf.pid}}\\n')"
+    sleeper = proof_of(SLEEPER.replace("time.sleep", tells + "; time.sleep"))
+    reported = []
+    with pytest.raises(KeyboardInterrupt):
+        with Lanes(lambda proof, outcome: reported.append(proof)) as lanes:
+            assert lanes.start(lambda running: (sleeper, 1, 1))
+            await_it(lambda: pids.exists() and pids.read_text().endswith("\n"))
+            raise KeyboardInterrupt
+    assert reported == []
+    for pid in pids.read_text().split():
+        await_end(int(pid))
 
 
-def test_figures_add_up_over_runs(runner: ModuleType) -> None:
-    proof = proof_of("")
-    runner.Figures().add(proof, proofs.Outcome(True, {"points": 3, "max_kib": 5}, "", 1), "a")
-    runner.Figures().add(proof, proofs.Outcome(True, {"points": 4, "max_kib": 2}, "", 2), "b")
-    row = runner.Figures().row(proof)
-    assert row["counts"] == {"points": 7, "max_kib": 5}
-    assert (row["starts"], row["seconds"], row["trees"]) == (2, 3, ["a", "b"])
-    assert runner.Figures().failed() == []
-
-
-def test_a_failure_is_kept_and_named(runner: ModuleType) -> None:
-    proof = proof_of("")
-    runner.Figures().add(proof, proofs.Outcome(False, {}, "what it printed", 1), "a")
-    [log] = runner.Figures().failed()
-    assert Path(log).read_text() == "what it printed"
-
-
-def test_the_proof_furthest_from_its_aim_is_next_and_each_start_has_its_own_seed(
-        runner: ModuleType, monkeypatch: pytest.MonkeyPatch, tmp_path: Path) -> None:
-    text = ("with open('%s', 'a') as out: print(told.seed, file=out)\n" % (tmp_path / "seeds")
-            + "time.sleep(0.05); count(points=told.amount, failures=0)")
-    near, far = proof_of(text, 2, "near", 10), proof_of(text, 2, "far", 40)
-    monkeypatch.setattr(proofs, "build", lambda wanted: None)
-    figures = runner.Figures()
-    while figures.done(far) < far.aim:
-        runner.work([near, far], 0.001, figures)
-    assert figures.done(near) <= 20
-    seeds = (tmp_path / "seeds").read_text().split()
-    assert sorted(seeds[:5], key=int) == ["2", "2", "3", "4", "5"]
-    assert json.loads((tmp_path / "figures.json").read_text())["far"]["counts"]["points"] >= 40
+def test_lanes_start_nothing_when_nothing_is_chosen() -> None:
+    with Lanes(lambda proof, outcome: None) as lanes:
+        assert not lanes.start(lambda running: None)
 
 
 def test_a_proof_that_cannot_start_has_failed_and_a_broken_report_is_told() -> None:
     outcomes = []
-    missing = Proof("missing", ("/nonexistent/program",), "points", 1, 1, 1, 1)
+    missing = Proof("missing", ("/nonexistent/program",), "points", 1, 1, 1, 1, 1)
     with Lanes(lambda proof, outcome: outcomes.append(outcome)) as lanes:
         lanes.start(lambda running: (missing, 1, 1))
     assert [outcome.passed for outcome in outcomes] == [False]
 
-    def report(proof: Proof, outcome: proofs.Outcome) -> None:
+    def report(proof: Proof, outcome: Outcome) -> None:
         raise OSError("disk full")
     with pytest.raises(OSError, match="disk full"):
         with Lanes(report) as lanes:

@@ -1,0 +1,199 @@
+"""tests/long/test_long_run.py: the long runner adds up what passed and nothing else, tree by tree."""
+import fcntl
+import json
+import os
+import signal
+import subprocess
+import sys
+import time
+from pathlib import Path
+from types import ModuleType
+
+import pytest
+
+import proofs
+from figures import Figures
+from proofs import Outcome, Proof
+from samples import await_end, await_it, proof_of, script
+
+
+@pytest.fixture
+def runner(tmp_path: Path, monkeypatch: pytest.MonkeyPatch) -> ModuleType:
+    module = script("run")
+    monkeypatch.setattr(module, "KEPT", tmp_path)
+    monkeypatch.setattr(proofs, "build", lambda wanted: None)
+    return module
+
+
+@pytest.fixture
+def figures(tmp_path: Path) -> Figures:
+    return Figures(tmp_path)
+
+
+def passed(**counts: int) -> Outcome:
+    return Outcome(True, counts, "", 60)
+
+
+def details(figures: Figures, proof: Proof) -> str:
+    return "\n".join(figures.lines((proof,)))
+
+
+def test_figures_add_up_over_runs_and_trees(tmp_path: Path) -> None:
+    proof = proof_of("")
+    Figures(tmp_path).add(proof, 3, 2, passed(points=3, max_kib=5), "a")
+    Figures(tmp_path).add(proof, 4, 3, passed(points=4, max_kib=2), "b-dirty")
+    Figures(tmp_path).add(proof, 1, 4, passed(points=1), "a")
+    figures = Figures(tmp_path)
+    assert figures.counts(proof) == {"points": 8, "max_kib": 5}
+    assert figures.trees(proof) == {"a": 4, "b-dirty": 4}
+    assert figures.minutes(proof) == 3
+    assert figures.failed() == []
+    shown = details(figures, proof)
+    assert "3 starts that passed on a: 4, b-dirty (changes in no commit): 4" in shown
+
+
+def test_a_failure_is_kept_and_named_and_counts_nothing(figures: Figures, tmp_path: Path) -> None:
+    proof = proof_of("")
+    figures.add(proof, 5, 2, passed(points=5), "a")
+    failed = Outcome(False, {"points": 900, "failures": 1}, "what it printed", 1)
+    figures.add(proof, 5, 3, failed, "b")
+    figures = Figures(tmp_path)
+    [log] = figures.failed()
+    assert Path(log).read_text() == "what it printed"
+    assert figures.done(proof) == 5
+    assert figures.counts(proof) == {"points": 5}
+    assert figures.trees(proof) == {"a": 5}
+    assert figures.next_seed(proof) == 4
+    shown = details(figures, proof)
+    assert "1 that failed" in shown and "900" not in shown and f"failed: {log}" in shown
+
+
+def test_the_least_fuzzed_target_is_shown(figures: Figures) -> None:
+    proof = proof_of("")
+    for seed, load, hashes in ((2, 50, 700), (3, 60, 10)):
+        figures.add(proof, 1, seed, passed(points=1, executions=9, executions_load=load,
+                                           executions_hashes=hashes, executions_replies=900), "a")
+    shown = details(figures, proof)
+    assert "110 executions of load, the least of 3 targets" in shown
+    assert "710" not in shown and "18 executions" in shown
+
+
+def test_figures_of_the_older_form_are_refused(tmp_path: Path) -> None:
+    (tmp_path / "figures.json").write_text('{"races": {"starts": 1}}')
+    with pytest.raises(SystemExit, match="--afresh"):
+        Figures(tmp_path)
+
+
+def test_the_proof_furthest_from_its_aim_is_next_and_each_start_has_its_own_seed(
+        runner: ModuleType, figures: Figures, tmp_path: Path) -> None:
+    text = ("with open('%s', 'a') as out: print(told.seed, file=out)\n" % (tmp_path / "seeds")
+            + "time.sleep(0.05); count(points=told.amount, failures=0)")
+    near, far = proof_of(text, 2, "near", 10), proof_of(text, 2, "far", 40)
+    while figures.done(far) < far.aim:
+        runner.work([near, far], 0.001, figures)
+    assert figures.done(near) <= 20
+    seeds = (tmp_path / "seeds").read_text().split()
+    assert sorted(seeds[:5], key=int) == ["2", "2", "3", "4", "5"]
+    assert Figures(tmp_path).done(far) >= 40
+
+
+@pytest.mark.parametrize("text", [
+    "count(points=told.amount, failures=1); sys.exit(1)",
+    "sys.exit(125)",
+])
+def test_a_proof_that_fails_always_is_left_alone_and_the_others_go_on(
+        runner: ModuleType, figures: Figures, tmp_path: Path, text: str,
+        capsys: pytest.CaptureFixture[str]) -> None:
+    bad = proof_of(text, 2, "bad", 1000)
+    good = proof_of("count(points=told.amount, failures=0)", 2, "good", 100)
+    started = time.monotonic()
+    runner.work([bad], 0.5, figures)  # minutes, of which it needs few seconds
+    assert time.monotonic() - started < 30
+    assert len(figures.failed()) == runner.MOST_FAILURES
+    assert figures.done(bad) == 0
+    assert f"bad failed {runner.MOST_FAILURES} times and is left alone" in capsys.readouterr().out
+    runner.work([bad, good], 0.03, figures)
+    assert len(figures.failed()) == 2 * runner.MOST_FAILURES
+    assert figures.done(good) > 0
+
+
+def test_a_tree_that_changed_since_it_was_built_is_told(
+        runner: ModuleType, figures: Figures, monkeypatch: pytest.MonkeyPatch) -> None:
+    states = iter(["a", "a", "a-dirty"])
+    monkeypatch.setattr(runner, "state_of_tree", lambda: next(states, "a-dirty"))
+    proof = proof_of("time.sleep(0.05); count(points=told.amount, failures=0)", aim=20)
+    while figures.done(proof) < 20:
+        runner.work([proof], 0.02, figures)
+    trees = list(figures.trees(proof))
+    assert trees[:2] == ["a", "a changed to a-dirty"]
+    assert "a changed to a-dirty (changes in no commit): " in details(figures, proof)
+
+
+def sample_run(folder: Path, *words: str, text: str = "") -> subprocess.Popen[str]:
+    """tests/long/run as a process, with figures of its own and one made-up proof."""
+    row = repr(proof_of(text))
+    program = ("import sys\n"
+               f"sys.path.insert(0, {str(Path(__file__).parent)!r})\n"
+               "import pathlib, proofs\n"
+               "from proofs import Proof\n"
+               "from samples import script\n"
+               f"proofs.PROOFS = ({row},)\n"
+               "proofs.build = lambda wanted: None\n"
+               "run = script('run')\n"
+               f"run.KEPT = pathlib.Path({str(folder)!r})\n"
+               "sys.exit(run.main())\n")
+    return subprocess.Popen([sys.executable, "-B", "-c", program, *words], text=True,
+                            stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+
+
+@pytest.mark.parametrize("number", [signal.SIGINT, signal.SIGTERM, signal.SIGHUP])
+def test_a_signal_to_the_runner_ends_its_proofs_which_then_do_not_count(
+        tmp_path: Path, number: signal.Signals) -> None:
+    pids = tmp_path / "pids"
+    text = ("child = subprocess.Popen(['sleep', '600'])\n"
+            f"new = pathlib.Path('{pids}.new')\n"
+            "new.write_text(f'{os.getpid()} {child.pid}')\n"
+            f"new.rename('{pids}')\n"
+            "time.sleep(600)\n")
+    with sample_run(tmp_path, "--minutes", "5", text=text) as run:
+        await_it(pids.exists)
+        run.send_signal(number)
+        assert run.wait(60) == 128 + number
+    for pid in pids.read_text().split():
+        await_end(int(pid))
+    assert not (tmp_path / "figures.json").exists()
+
+
+def test_a_second_run_ends_at_once_and_says_why(tmp_path: Path) -> None:
+    held = tmp_path / "held"
+    text = f"pathlib.Path('{held}').touch(); time.sleep(600)"
+    with sample_run(tmp_path, "--minutes", "5", text=text) as first:
+        await_it(held.exists)
+        for words in (("--minutes", "5"), ("--afresh",)):
+            with sample_run(tmp_path, *words) as second:
+                said = second.communicate(timeout=60)[0]
+            assert second.returncode == 1
+            assert f"another tests/long/run, process {first.pid}, works on the figures" in said
+        with sample_run(tmp_path, "--show") as show:
+            assert "0 failed starts" in show.communicate(timeout=60)[0]
+        first.terminate()
+    with (tmp_path / "lock").open() as lock:
+        fcntl.flock(lock, fcntl.LOCK_EX | fcntl.LOCK_NB)
+
+
+def test_afresh_forgets_all_but_the_lock(tmp_path: Path, figures: Figures) -> None:
+    figures.add(proof_of(""), 1, 2, Outcome(False, {}, "", 1), "a")
+    (tmp_path / "lock").touch()
+    before = os.stat(tmp_path / "lock").st_ino
+    with sample_run(tmp_path, "--afresh") as run:
+        assert run.wait(60) == 0
+    assert os.listdir(tmp_path) == ["lock"]
+    assert os.stat(tmp_path / "lock").st_ino == before
+
+
+def test_the_file_of_figures_holds_every_start(figures: Figures, tmp_path: Path) -> None:
+    proof = proof_of("")
+    figures.add(proof, 3, 2, passed(points=3), "a")
+    figures.add(proof, 3, 3, Outcome(False, {"points": 3}, "", 1), "a")
+    starts = json.loads((tmp_path / "figures.json").read_text())
+    assert [(start["seed"], start["passed"]) for start in starts] == [(2, True), (3, False)]
