@@ -131,14 +131,16 @@ static std::size_t flags_in(std::string_view text) {
     return longest;
 }
 
-std::size_t boot_copies::flags_length() const {
+int boot_copies::flags_length(std::size_t *out_length) const {
     std::size_t longest = 0;
     for (int i = 0; i < count_; i++) {
         const copy_bytes bytes = read_copy(copies_[i]);
-        if (bytes != nullptr)
-            longest = std::max(longest, flags_in({bytes.get(), copies_[i].size}));
+        if (bytes == nullptr)
+            return -errno;
+        longest = std::max(longest, flags_in({bytes.get(), copies_[i].size}));
     }
-    return longest;
+    *out_length = longest;
+    return 0;
 }
 
 int boot_copies::sync() const {

@@ -31,8 +31,9 @@ class boot_copies {
     std::size_t capacity() const;
 
     // The longest list of flags in any copy, with what libubootenv adds to it when it writes the
-    // list again; 0 where there is none. The copies are open.
-    std::size_t flags_length() const;
+    // list again; 0 where there is none. -EIO where a copy cannot be read whole. The copies are
+    // open.
+    int flags_length(std::size_t *out_length) const;
 
     // libubootenv does not look at the result of its own fsync. The copies are open.
     int sync() const;

@@ -71,9 +71,13 @@ class environment {
     int store() {
         // libubootenv takes a list whose empty string behind the last parameter does not fit any
         // more, and then cannot read it; and it writes a list of flags beyond the end.
-        if (length() + copies_.flags_length() + 1 > copies_.capacity())
+        std::size_t flags = 0;
+        int result = copies_.flags_length(&flags);
+        if (result != 0)
+            return result;
+        if (length() + flags + 1 > copies_.capacity())
             return -ENOSPC;
-        const int result = libuboot_env_store(ctx_);
+        result = libuboot_env_store(ctx_);
         return result == 0 ? copies_.sync() : result;
     }
 
