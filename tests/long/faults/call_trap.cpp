@@ -1,12 +1,14 @@
 // tests/long/faults/call_trap.cpp: the file-system calls of this process, caught by a filter of the
-// kernel, which raises SIGSYS in their place.
+// kernel, which raises SIGSYS in place of all calls but those that touch no file.
 #include "tests/long/faults/call_trap.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
 #include <cstring>
 #include <iterator>
+#include <span>
 
 #include <fcntl.h>
 #include <linux/filter.h>
@@ -17,70 +19,11 @@
 #include <ucontext.h>
 #include <unistd.h>
 
-// A call with this as its sixth argument, which none of these calls has, is the trap's own.
+#include "tests/long/faults/call_table.h"
+
+// A call with this as its sixth argument, which none of these calls has, is the trap's own. Calls
+// that have a sixth are of those that pass.
 static constexpr unsigned long OWN_CALL = 0x2ea7c0de;
-
-enum class takes { PATH, FOLDER_AND_PATH, DESCRIPTOR };
-
-struct known_call {
-    long number;
-    const char *name;
-    takes first;
-};
-
-#define AT(call, name) \
-    { SYS_##call, name, takes::FOLDER_AND_PATH }
-#define ON(call, name) \
-    { SYS_##call, name, takes::DESCRIPTOR }
-static constexpr known_call known_calls[] = {
-    AT(openat, "open"),
-    AT(newfstatat, "stat"),
-    AT(statx, "stat"),
-    AT(renameat, "rename"),
-    AT(renameat2, "rename"),
-    AT(unlinkat, "unlink"),
-    AT(mkdirat, "mkdir"),
-    AT(faccessat, "access"),
-    AT(faccessat2, "access"),
-    AT(fchmodat, "chmod"),
-    AT(fchownat, "chown"),
-    AT(symlinkat, "symlink"),
-    ON(read, "read"),
-    ON(pread64, "read"),
-    ON(readv, "read"),
-    ON(write, "write"),
-    ON(pwrite64, "write"),
-    ON(writev, "write"),
-    ON(close, "close"),
-    ON(fstat, "fstat"),
-    ON(fchmod, "fchmod"),
-    ON(fchown, "fchown"),
-    ON(fsync, "fsync"),
-    ON(fdatasync, "fsync"),
-    ON(flock, "flock"),
-    ON(fcntl, "fcntl"),
-    ON(lseek, "lseek"),
-    ON(ftruncate, "truncate"),
-    ON(ioctl, "ioctl"),
-    ON(getdents64, "list"),
-#ifdef SYS_open  // Newer machines have only the calls above.
-    {SYS_open,     "open",     takes::PATH},
-    {SYS_creat,    "open",     takes::PATH},
-    {SYS_stat,     "stat",     takes::PATH},
-    {SYS_lstat,    "stat",     takes::PATH},
-    {SYS_access,   "access",   takes::PATH},
-    {SYS_rename,   "rename",   takes::PATH},
-    {SYS_unlink,   "unlink",   takes::PATH},
-    {SYS_mkdir,    "mkdir",    takes::PATH},
-    {SYS_chmod,    "chmod",    takes::PATH},
-    {SYS_chown,    "chown",    takes::PATH},
-    {SYS_truncate, "truncate", takes::PATH},
-    {SYS_link,     "link",     takes::PATH},
-    {SYS_symlink,  "symlink",  takes::PATH},
-#endif
-};
-#undef AT
-#undef ON
 
 static constexpr int MAX_DESCRIPTORS = 128;
 static constexpr std::size_t PATH_SIZE = sizeof(trapped_call::path);
@@ -93,17 +36,20 @@ static char paths[MAX_DESCRIPTORS][PATH_SIZE];
 static char failing_line[sizeof(trapped_call::name) + PATH_SIZE + 1];
 static int failing_error;
 
-call_trace *make_shared_trace() {
-    void *memory = mmap(nullptr, sizeof(call_trace), PROT_READ | PROT_WRITE,
-                        MAP_SHARED | MAP_ANONYMOUS, -1, 0);
-    return memory != MAP_FAILED ? static_cast<call_trace *>(memory) : nullptr;
+// What the proofs do not know, of this process and its children.
+struct unknown_calls {
+    long first;  // 0: none
+    char behind[sizeof(trapped_call::name) + PATH_SIZE + 1];
+};
+static unknown_calls *unknown;
+
+static void *shared_memory(std::size_t size) {
+    void *memory = mmap(nullptr, size, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+    return memory != MAP_FAILED ? memory : nullptr;
 }
 
-static const known_call *find_call(long number) {
-    for (const known_call &row : known_calls)
-        if (row.number == number)
-            return &row;
-    return nullptr;
+call_trace *make_shared_trace() {
+    return static_cast<call_trace *>(shared_memory(sizeof(call_trace)));
 }
 
 static bool is_labelled(long fd) {
@@ -126,9 +72,10 @@ static void take_path_in_folder(char *to, long folder, const char *path) {
         take_path(to, path);
 }
 
-// The C library's own data, which it reads once in a process or not at all.
-static bool is_of_library(const trapped_call &call) {
-    return std::strncmp(call.path, "/usr/", 5) == 0;
+// The C library's own data, which it reads once in a process or not at all, and what the tests ask
+// for the name of a descriptor.
+static bool is_left_out(const trapped_call &call) {
+    return std::strncmp(call.path, "/usr/", 5) == 0 || std::strncmp(call.path, "/proc/", 6) == 0;
 }
 
 // False for a call on something that was opened before the trap began.
@@ -219,11 +166,38 @@ static long follow_plan(const known_call *row, long *arguments, trapped_call *ca
     return call->result;
 }
 
+static long refuse_unknown(long number) {
+    if (unknown->first == 0) {
+        const int last = std::min(trace->count, call_trace::MAX_CALLS) - 1;
+        if (last >= 0)
+            (void)std::snprintf(unknown->behind, sizeof unknown->behind, "%s %s",
+                                trace->calls[last].name, trace->calls[last].path);
+        unknown->first = number;
+    }
+    return -ENOSYS;
+}
+
+// A second descriptor of a file would not be followed; nor is one that was there before the trap,
+// of which only what is printed is written.
+static bool is_unknown(const known_call *row, const long *arguments) {
+    static constexpr const char *changes[] = {"write",  "truncate", "fchmod",
+                                              "fchown", "fsync",    "ioctl"};
+    if (row == nullptr)
+        return true;
+    if (row->number == SYS_fcntl)
+        return arguments[1] == F_DUPFD || arguments[1] == F_DUPFD_CLOEXEC;
+    return row->first == takes::DESCRIPTOR && arguments[0] > STDERR_FILENO &&
+           !is_labelled(arguments[0]) &&
+           std::any_of(std::begin(changes), std::end(changes),
+                       [row](const char *name) { return std::strcmp(name, row->name) == 0; });
+}
+
 static long answer(long number, long *arguments) {
     const known_call *row = find_call(number);
     trapped_call call;
-    if (trace == nullptr || row == nullptr || !describe(row, arguments, &call) ||
-        is_of_library(call))
+    if (trace != nullptr && is_unknown(row, arguments))
+        return refuse_unknown(number);
+    if (trace == nullptr || !describe(row, arguments, &call) || is_left_out(call))
         return make_call(number, arguments);
 
     const long result = follow_plan(row, arguments, &call);
@@ -254,27 +228,39 @@ static void on_trapped_call(int /*signal*/, siginfo_t *info, void *context) {
 }
 
 bool install_call_trap() {
-    static constexpr std::size_t CALLS = std::size(known_calls);
-    // The end is the trap; the one before it lets the call pass.
-    sock_filter filter[CALLS + 5] = {
+    static constexpr std::size_t MAX_CALLS = 250;  // which a jump is able to pass over
+    const std::span<const long> passing = passing_calls();
+    const std::size_t count = passing.size();
+    if (count > MAX_CALLS) {
+        errno = E2BIG;
+        return false;
+    }
+    // The end lets the call pass; the one before it is the trap.
+    sock_filter filter[MAX_CALLS + 5] = {
         BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, args[5])),
-        BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, OWN_CALL, CALLS + 1, 0),
+        BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, OWN_CALL, static_cast<unsigned char>(count + 2), 0),
         BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
     };
-    for (std::size_t i = 0; i < CALLS; i++)
-        filter[3 + i] =
-            BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, static_cast<unsigned>(known_calls[i].number),
-                     static_cast<unsigned char>(CALLS - i), 0);
-    filter[3 + CALLS] = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW);
-    filter[4 + CALLS] = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_TRAP);
-    const sock_fprog program = {static_cast<unsigned short>(std::size(filter)), filter};
+    for (std::size_t i = 0; i < count; i++)
+        filter[3 + i] = BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, static_cast<unsigned>(passing[i]),
+                                 static_cast<unsigned char>(count - i), 0);
+    filter[3 + count] = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_TRAP);
+    filter[4 + count] = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW);
+    const sock_fprog program = {static_cast<unsigned short>(count + 5), filter};
 
+    unknown = static_cast<unknown_calls *>(shared_memory(sizeof *unknown));
     struct sigaction action = {};
     action.sa_sigaction = on_trapped_call;
     action.sa_flags = SA_SIGINFO;
-    return sigaction(SIGSYS, &action, nullptr) == 0 &&
+    return unknown != nullptr && sigaction(SIGSYS, &action, nullptr) == 0 &&
            prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) == 0 &&
            prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program) == 0;
+}
+
+std::string unknown_call() {
+    if (unknown == nullptr || unknown->first == 0)
+        return "";
+    return "system call " + std::to_string(unknown->first) + " behind '" + unknown->behind + "'";
 }
 
 void begin_trap(call_trace *recorded, const trap_plan &wanted, const std::string &folder) {

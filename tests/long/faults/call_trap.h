@@ -41,14 +41,19 @@ struct trap_plan {
     int also_error = 0;
 };
 
-// Sends all file-system calls of the process through here, for good; children inherit it. False
-// with errno set where the kernel refuses.
+// Sends all calls of the process but those that touch no file through here, for good; children
+// inherit it. False with errno set where the kernel refuses.
 bool install_call_trap();
 
 // Between the two, calls are recorded and the plan is followed. A path below the folder is recorded
 // without it. Close closes also where it is made to fail.
 void begin_trap(call_trace *recorded, const trap_plan &wanted, const std::string &folder = "");
 void end_trap();
+
+// The first call that was made between the two, by whatever process, though the proofs do not know
+// it: one that may change a file, and that could neither be told of nor struck. It was not made,
+// and failed with ENOSYS. "" for none; what proves anything by the trap fails with it.
+std::string unknown_call();
 
 // "<call> <path>"
 std::string line_of(const trapped_call &call);

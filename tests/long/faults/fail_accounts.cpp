@@ -332,6 +332,13 @@ std::string account_failer::run_one_by_chance(usermgmt_ctx *ctx, const operation
     return follow(ctx, expected, &result);
 }
 
+static operation next_change(random_operations *chance) {
+    operation what = chance->next_operation(false);
+    while (what.kind == operation_kind::reopen)
+        what = chance->next_operation(false);
+    return what;
+}
+
 void account_failer::run_by_chance(random_operations *chance) {
     static constexpr int errors[] = {EIO, ENOSPC, EDQUOT, EROFS, EACCES, EPERM};
     starting_files files = chance->next_files();
@@ -343,9 +350,7 @@ void account_failer::run_by_chance(random_operations *chance) {
     std::string wrong = slot.error;
     std::string done;
     for (unsigned left = 3 + chance->below(6); wrong.empty() && left > 0; left--) {
-        const operation what = chance->next_operation(false);
-        if (what.kind == operation_kind::reopen)
-            continue;
+        const operation what = next_change(chance);
         trap_plan plan;
         plan.fail_at = static_cast<int>(chance->below(55));
         plan.error = errors[chance->below(std::size(errors))];
@@ -355,6 +360,11 @@ void account_failer::run_by_chance(random_operations *chance) {
                 (last_->struck ? " " + line_of(last_->calls[plan.fail_at]) +
                                      " failing: " + shown({plan.error, 0, plan.for_ever})
                                : " was not made");
+    }
+    // The last fault of all, too, is followed by a change that none befalls.
+    if (wrong.empty()) {
+        wrong = run_one_by_chance(slot.ctx.get(), next_change(chance), {});
+        done += "\n" + described(from_.what);
     }
     if (!wrong.empty())
         report_->fail("by chance, open flags " + std::to_string(files.open_flags) + ":" + done +

@@ -1,5 +1,6 @@
 // tests/long/faults/failing_calls.cpp: the proof that any file-system call may fail without more
 // harm than an answer that says so.
+#include "tests/long/faults/call_trap.h"
 #include "tests/long/faults/fail_accounts.h"
 #include "tests/long/faults/fail_stores.h"
 #include "tests/long/faults/proof_place.h"
@@ -17,6 +18,8 @@ int main(int count, char **words) {
     fail_every_store_call(&report, place.folder(), options.amount);
     report.count("exhaustive_faults", report.figure("faults"));
     fail_random_account_calls(&report, options.amount, options.seed);
+    if (const std::string call = unknown_call(); !call.empty())
+        report.fail("a call was made that the proof does not know: " + call);
     if (report.figure("faults") == 0)
         report.fail("nothing was struck");
     return report.finish(options);

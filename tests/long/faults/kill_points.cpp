@@ -2,6 +2,7 @@
 // calls without an account, a password of the web server, a parameter or the boot block being lost.
 #include <cstdio>
 
+#include "tests/long/faults/call_trap.h"
 #include "tests/long/faults/kill_accounts.h"
 #include "tests/long/faults/kill_stores.h"
 #include "tests/long/faults/proof_place.h"
@@ -21,6 +22,8 @@ int main(int count, char **words) {
     kill_random_account_operations(&report, options.amount, options.seed);
     if (!outside_is_untouched())
         report.fail("what a link led to was written");
+    if (const std::string call = unknown_call(); !call.empty())
+        report.fail("a call was made that the proof does not know: " + call);
     if (report.figure("points") == 0)
         report.fail("nothing was struck");
     return report.finish(options);

@@ -1,22 +1,22 @@
 // tests/long/faults/store_cases.cpp: the operations on the web server's passwords, the parameters
-// and the boot block that are struck, and the files that they start from.
+// and the boot block that are struck, the files that they start from, and those that they end in.
 #include "tests/long/faults/store_cases.h"
 
 #include <cstdlib>
+#include <cstring>
 
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <glib.h>
 
-#include "platform/bootparam/bootparam.h"
+#include "methods/accounts/notify.h"
 #include "platform/digest_entry/digest_file.h"
 #include "platform/paramcli/param_file.h"
 #include "platform/paramcli/paramcli.h"
-
-static constexpr const char *BOOT_FOLDER = "/etc/boot";
-static constexpr const char *BOOT_CONFIG = "/etc/fw_env.config";
-static constexpr std::size_t COPY_SIZE = 0x2000;
+#include "tests/long/faults/boot_cases.h"
+#include "tests/long/faults/boot_files.h"
+#include "tests/long/faults/glib_log.h"
 
 static const std::string digest_text =
     "alice:PRIVANE:0123456789abcdef0123456789abcdef\n"
@@ -35,141 +35,150 @@ static lying_file web_file(const std::string &text, mode_t mode) {
     return file;
 }
 
-using starts = std::vector<std::pair<std::string, folder_state>>;
+struct store_start {
+    std::string name;
+    folder_state files;
+    bool has_file;
+};
 
-static starts starts_of(const std::string &name, const lying_file &file) {
+static std::vector<store_start> starts_of(const std::string &name, const lying_file &file) {
     lying_file link = plain_file("../../outside", 0777);
     link.mode = S_IFLNK | 0777;
     const lying_file lock = plain_file("", 0600);
+    const lying_file own = plain_file("alice:PRIV", 0600);
     return {
-        {"",                   {{name, file}, {name + ".lock", lock}}                         },
-        {", first time",       {}                                                             },
-        {", own leftover",     {{name, file}, {name + ".tmp", plain_file("alice:PRIV", 0600)}}},
-        {", foreign leftover", {{name, file}, {name + ".tmp", web_file("root", 04666)}}       },
-        {", link as leftover", {{name, file}, {name + ".tmp", link}}                          },
+        {"",                   {{name, file}, {name + ".lock", lock}},                   true },
+        {", first time",       {},                                                       false},
+        {", own leftover",     {{name, file}, {name + ".tmp", own}},                     true },
+        {", foreign leftover", {{name, file}, {name + ".tmp", web_file("root", 04666)}}, true },
+        {", link as leftover", {{name, file}, {name + ".tmp", link}},                    true },
     };
 }
+
+// The lock stays, a temporary file does not.
+static folder_state end_of(const std::string &name, const lying_file &file) {
+    folder_state files = {
+        {name + ".lock", plain_file("", 0600)}
+    };
+    if (!file.text.empty())
+        files[name] = file;
+    return files;
+}
+
+struct digest_row {
+    const char *name;
+    int (*change)(const char *path);
+    const char *after;
+    const char *after_first_time;  // "" where there is no file even then
+};
+
+// The sums are md5sum's, of "alice:PRIVANE:secret" and "carol:PRIVANE:secret".
+static constexpr digest_row digest_rows[] = {
+    {"digest set",               [](const char *path) { return digest_file_set(path, "alice", "secret"); },
+     "alice:PRIVANE:427f14472e033f24869b1602e6871ed7\n"
+     "bob:PRIVANE:fedcba9876543210fedcba9876543210\n"
+     "alice:OTHER:00000000000000000000000000000000\n",         "alice:PRIVANE:427f14472e033f24869b1602e6871ed7\n"   },
+    {"digest set of a new user",
+     [](const char *path) { return digest_file_set(path, "carol", "secret"); },
+     "alice:PRIVANE:0123456789abcdef0123456789abcdef\n"
+     "bob:PRIVANE:fedcba9876543210fedcba9876543210\n"
+     "alice:OTHER:00000000000000000000000000000000\n"
+     "carol:PRIVANE:ea73789203e420776a22a84326d23dd1\n",       "carol:PRIVANE:ea73789203e420776a22a84326d23dd1\n"   },
+    {"digest delete",            [](const char *path) { return digest_file_delete(path, "bob"); },
+     "alice:PRIVANE:0123456789abcdef0123456789abcdef\n"
+     "alice:OTHER:00000000000000000000000000000000\n",         ""                                                   },
+    {"digest set list",
+     [](const char *path) {
+         return digest_file_set_list(path,
+                                     "bob:PRIVANE:11111111111111111111111111111111\n"
+                                     "dave:PRIVANE:22222222222222222222222222222222\n");
+     },                                                                                                     "alice:PRIVANE:0123456789abcdef0123456789abcdef\n"
+     "bob:PRIVANE:11111111111111111111111111111111\n"
+     "alice:OTHER:00000000000000000000000000000000\n"
+     "dave:PRIVANE:22222222222222222222222222222222\n", "bob:PRIVANE:11111111111111111111111111111111\n"
+     "dave:PRIVANE:22222222222222222222222222222222\n"},
+    {"digest delete list",
+     [](const char *path) { return digest_file_delete_list(path, "alice\nbob\n"); },
+     "alice:OTHER:00000000000000000000000000000000\n",         ""                                                   },
+};
 
 static void add_digest_cases(const std::string &folder, std::vector<store_case> *cases) {
-    static std::string path;
-    path = folder + "/digest";
-    struct row {
-        const char *name;
-        int (*run)();
-    };
-    static constexpr row rows[] = {
-        {"digest set",               [] { return digest_file_set(path.c_str(), "alice", "secret"); }},
-        {"digest set of a new user",
-         [] { return digest_file_set(path.c_str(), "carol", "secret"); }                            },
-        {"digest delete",            [] { return digest_file_delete(path.c_str(), "bob"); }         },
-        {"digest set list",
-         [] {
-             return digest_file_set_list(path.c_str(),
-                                         "bob:PRIVANE:11111111111111111111111111111111\n"
-                                         "dave:PRIVANE:22222222222222222222222222222222\n");
-         }                                                                                          },
-        {"digest delete list",
-         [] { return digest_file_delete_list(path.c_str(), "alice\nbob\n"); }                       },
-    };
-    for (const row &one : rows)
-        for (const auto &[name, files] : starts_of("digest", web_file(digest_text, 0640)))
-            cases->push_back({one.name + name, folder, files, "digest", one.run});
+    for (const digest_row &one : digest_rows) {
+        const auto run = [change = one.change, path = folder + "/digest"] {
+            store_answer answer;
+            const glib_log log;
+            answer.number = change(path.c_str());
+            answer.log = log.taken();
+            return answer;
+        };
+        for (const store_start &start : starts_of("digest", web_file(digest_text, 0640)))
+            cases->push_back(
+                {one.name + start.name, store_kind::DIGEST, folder, start.files,
+                 end_of("digest", start.has_file ? web_file(one.after, 0640)
+                                                 : plain_file(one.after_first_time, 0640)),
+                 "digest", run});
+    }
 }
 
-static int sync_parameter(const std::string &path) {
+// The block is emptied by success, and as it was after a failure.
+static store_answer sync_parameters(const std::string &path) {
+    paramcli_options empty;
     paramcli_options options;
     int error = 0;
+    std::memset(&empty, 0, sizeof empty);
+    std::memset(&options, 0, sizeof options);
+    paramcli_reset_options(&empty);
     paramcli_reset_options(&options);
     paramcli_set_custom_param("root.System.RootPwdSet", "yes", &options, &error);
     paramcli_set_custom_param("root.New", "2", &options, &error);
-    return error != 0 ? error : param_file_sync(path.c_str(), &options);
+    const paramcli_options before = options;
+
+    store_answer answer;
+    const glib_log log;
+    answer.number = error != 0 ? error : param_file_sync(path.c_str(), &options);
+    answer.log = log.taken();
+    const paramcli_options &expected = answer.number == 0 ? empty : before;
+    if (options.mark != expected.mark || options.length != expected.length ||
+        std::memcmp(options.pending, expected.pending, expected.length) != 0)
+        answer.wrong =
+            "the block holds what it may not: " + std::string(options.pending, options.length);
+    return answer;
+}
+
+// The service's own change, which fails nobody's call.
+static store_answer set_flag() {
+    static constexpr const char *FAILED =
+        "warning Updating root user failed to sync param! Error: ";
+    store_answer answer;
+    const glib_log log;
+    set_root_password_flag();
+    answer.log = log.taken();
+    if (answer.log.size() == 1 && answer.log[0].starts_with(FAILED))
+        answer.number = std::atoi(answer.log[0].c_str() + std::strlen(FAILED));
+    return answer;
 }
 
 static void add_param_cases(const std::string &folder, std::vector<store_case> *cases) {
-    const auto run = [path = folder + "/params"] { return sync_parameter(path); };
-    for (const auto &[name, files] : starts_of("params", web_file(param_text, 0604)))
-        cases->push_back({"parameter sync" + name, folder, files, "params", run});
-    cases->push_back({"parameter sync, no folder", folder, {}, "params", run, true});
-}
-
-static int write_boot_parameter(const char *name, const char *value) {
-    bootparam_chip chip;
-    int error = 0;
-    bootparam_default_chip(&chip);
-    const int result = bootparam_set_chip(0, &error, &chip);
-    return result != 0 ? result : bootparam_write(name, value, &error, &chip);
-}
-
-static std::string read_boot_parameter(const char *name) {
-    bootparam_chip chip;
-    char *value = nullptr;
-    int error = 0;
-    bootparam_default_chip(&chip);
-    const int result = bootparam_read(name, &value, 0, &error, &chip);
-    std::string text = value != nullptr ? value : "";
-    std::free(value);
-    if (result == BOOTPARAM_OK)
-        return text;
-    return result == BOOTPARAM_BLANK    ? "blank"
-           : result == BOOTPARAM_ABSENT ? "none"
-                                        : "failed with " + std::to_string(error);
-}
-
-std::string read_boot_block() {
-    const std::string a = read_boot_parameter("a");
-    return a == "blank"
-               ? a
-               : "a=" + a + " b=" + read_boot_parameter("b") + " c=" + read_boot_parameter("c");
-}
-
-std::string judge_boot_block(const std::string &before, const std::string &after) {
-    const std::string now = read_boot_block();
-    return now == before || now == after ? "" : "the boot block is now " + now;
-}
-
-std::string write_on_boot_block() {
-    const std::string before = read_boot_block();
-    if (const int result = write_boot_parameter("later", "1"); result != 0)
-        return "the next write answers " + std::to_string(result);
-    const std::string now = read_boot_block();
-    if (read_boot_parameter("later") != "1" ||
-        now != (before == "blank" ? "a=none b=none c=none" : before))
-        return "after the next write the boot block is " + now;
-    return "";
-}
-
-static void add_boot_cases(std::vector<store_case> *cases) {
-    const folder_state blank = {
-        {"copy0", plain_file(std::string(COPY_SIZE, '\xff'), 0600)},
-        {"copy1", plain_file(std::string(COPY_SIZE, '\xff'), 0600)}
-    };
-    const std::string config = "/etc/boot/copy0 0x0 0x2000\n/etc/boot/copy1 0x0 0x2000\n";
-    const store_case write = {"boot block write", BOOT_FOLDER, blank, "",
-                              [] { return write_boot_parameter("a", "new"); }};
-    if (!g_file_set_contents(BOOT_CONFIG, config.c_str(), -1, nullptr) ||
-        mkdir(BOOT_FOLDER, 0700) != 0)
-        std::exit(125);
-
-    put_back_folder(BOOT_FOLDER, blank);
-    cases->push_back(write);
-    cases->back().name += ", blank copies";
-    if (write_boot_parameter("b", "kept") != 0)
-        std::exit(125);
-    cases->push_back(write);
-    cases->back().name += ", one blank copy";
-    cases->back().files = look_at_folder(BOOT_FOLDER);
-    for (const char *name : {"copy0", "copy1"}) {
-        // What only the newer copy knows tells which one was read.
-        if (write_boot_parameter("c", name) != 0 || write_boot_parameter("a", "old") != 0 ||
-            write_boot_parameter("c", "newest") != 0)
-            std::exit(125);
-        cases->push_back(write);
-        cases->back().name += std::string(", two copies, writing began with ") + name;
-        cases->back().files = look_at_folder(BOOT_FOLDER);
-        cases->push_back(cases->back());
-        cases->back().name += ", broken";
-        cases->back().files[name].text[9] ^= 1;
-    }
+    const auto run = [path = folder + "/params"] { return sync_parameters(path); };
+    for (const store_start &start : starts_of("params", web_file(param_text, 0604)))
+        cases->push_back(
+            {"parameter sync" + start.name, store_kind::PARAMETERS, folder, start.files,
+             end_of("params",
+                    start.has_file
+                        ? web_file("# a comment\nroot.System.RootPwdSet=yes\nroot.Other=1\n"
+                                   "root.New=2\n",
+                                   0604)
+                        : plain_file("root.System.RootPwdSet=yes\nroot.New=2\n", 0644)),
+             "params", run});
+    const char *name = "parameters.conf";
+    cases->push_back({"root's password flag, no folder",
+                      store_kind::ROOT_FLAG,
+                      "/etc/privane",
+                      {},
+                      end_of(name, plain_file("root.System.RootPwdSet=yes\n", 0644)),
+                      name,
+                      set_flag,
+                      true});
 }
 
 std::vector<store_case> store_cases(const std::string &folder) {
@@ -181,6 +190,12 @@ std::vector<store_case> store_cases(const std::string &folder) {
     add_param_cases(folder + "/store", &cases);
     add_boot_cases(&cases);
     return cases;
+}
+
+folder_state store_files_after(const store_case &one, const folder_state &start) {
+    return one.kind == store_kind::BOOT_BLOCK && start != one.files
+               ? boot_files_after(start, "a", "new")
+               : one.after;
 }
 
 folder_state look_at_store(const store_case &one) {
