@@ -11,13 +11,14 @@ from pathlib import Path
 from typing import Any, Callable, Iterator, Sequence
 
 import pytest
+from gi.repository import GLib
 
 from account_watch import Watch, require_agreement
 from expectations import PREFIX, Expectations, refusal_by_polkit
 from harness import process
 from harness.accounts import (CLERK_UID, STANDARD_GROUP, STANDARD_PASSWD, STANDARD_SHADOW,
                               AccountFiles)
-from harness.bus import Bus, BusError, domain_error
+from harness.bus import INTERFACE, NAME, PATH, Bus, BusError, domain_error
 from harness.deadline import wait_for
 from harness.device import Device
 from harness.fake_authz import CODE, DOMAIN, FakeAuthz
@@ -170,10 +171,13 @@ class Fuzzing:
             line.send_raw(blob)
             line.close()
             self._figures["broken_messages"] += 1
-        for _ in range(3):  # by then the service has read what came of them
-            self.stage.bus.send("com.zintor.PrivaneSystem", "/", "org.freedesktop.DBus.Peer",
-                                "Ping")
+        # By then the bus has passed on what came of them, and, as the main loop answers this one, the
+        # service has served it.
+        for _ in range(3):
+            self.stage.bus.send(NAME, PATH, "org.freedesktop.DBus.Properties", "GetAll",
+                                GLib.Variant("(s)", (INTERFACE,)))
         self._look()
+        self._reap()
         self._sanitized.require_no_report()
 
     def _reap(self) -> None:
