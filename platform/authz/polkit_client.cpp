@@ -4,6 +4,7 @@
 // answer of another form as if it were one.
 #include "platform/authz/polkit_client.h"
 
+#include <algorithm>
 #include <cstring>
 
 #include <gio/gio.h>
@@ -23,11 +24,13 @@ static constexpr guint32 NO_INTERACTION = 0;
 // For what the bus itself is asked besides, which it knows at once.
 static constexpr int BUS_DEADLINE_MS = 1000;
 
-// The bus drops an answer when others fill what it keeps for this process. So what is not answered
-// by then is asked once more, and again after twice the time each: polkit also works on the
-// questions whose answers nobody needs any more, and must not be kept from the next ones. Any
-// answer will do.
-static constexpr guint FIRST_REPEAT_MS = 1000;
+// The bus drops an answer when others fill what it keeps for this process. Asking again in any case
+// would make a slow polkit work on questions whose answers nobody needs any more, and keep it from
+// the next ones. So it is asked something cheap behind the question: polkit answers in the order in
+// which it is asked, and when the second answer comes alone, the first is lost.
+static constexpr guint FIRST_PROBE_MS = 250;
+static constexpr guint LAST_PROBE_MS = 1000;
+static constexpr const char *PROBED_PROPERTY = "BackendVersion";
 
 enum class polkit_answer { ALLOWED, REFUSED, NEEDS_PASSWORD };
 
@@ -47,11 +50,17 @@ struct question {
 struct pending_check {
     const question *asked;
     GCancellable *cancellable;
-    GSource *silence;  // of the next repetition; owned
+    GSource *silence;  // until the next probe; owned
     guint silence_ms;
-    guint unanswered;
+    guint questions;   // how often it was asked
+    guint unanswered;  // calls, the probes included
     GVariant *answer;  // the first, or
     GError *error;     // why there is none
+};
+
+struct probe {
+    pending_check *pending;
+    guint questions;  // that polkit had been asked when it was sent
 };
 
 static int remaining_ms(gint64 deadline) {
@@ -104,11 +113,35 @@ static void on_answer(GObject *, GAsyncResult *result, void *data) {
 
 // A sound answer is one of the right form; GDBus makes any other an error.
 static void send_question(pending_check *pending) {
+    pending->questions++;
     pending->unanswered++;
     g_dbus_connection_call(
         client_bus, POLKIT_NAME, AUTHORITY_PATH, AUTHORITY_INTERFACE, "CheckAuthorization",
         arguments_of(*pending->asked), G_VARIANT_TYPE(ANSWER_TYPE), G_DBUS_CALL_FLAGS_NONE,
         remaining_ms(pending->asked->deadline), pending->cancellable, on_answer, pending);
+}
+
+static void on_probe_answer(GObject *, GAsyncResult *result, void *data) {
+    g_autofree auto *sent = static_cast<probe *>(data);
+    pending_check *pending = sent->pending;
+    // An error may be the bus's own, and tells nothing of what polkit has answered.
+    g_autoptr(GVariant) version = g_dbus_connection_call_finish(client_bus, result, nullptr);
+
+    pending->unanswered--;
+    if (version != nullptr && sent->questions == pending->questions && !has_ended(*pending))
+        send_question(pending);
+}
+
+static void send_probe(pending_check *pending) {
+    auto *sent = g_new(probe, 1);
+    *sent = {pending, pending->questions};
+    pending->unanswered++;
+    g_dbus_connection_call(client_bus, POLKIT_NAME, AUTHORITY_PATH,
+                           "org.freedesktop.DBus.Properties", "Get",
+                           g_variant_new("(ss)", AUTHORITY_INTERFACE, PROBED_PROPERTY),
+                           G_VARIANT_TYPE("(v)"), G_DBUS_CALL_FLAGS_NONE,
+                           remaining_ms(pending->asked->deadline), pending->cancellable,
+                           on_probe_answer, sent);
 }
 
 static gboolean on_silence(void *data);
@@ -129,15 +162,15 @@ static gboolean on_silence(void *data) {
     auto *pending = static_cast<pending_check *>(data);
 
     end_silence(pending);
-    send_question(pending);
-    await_silence(pending, 2 * pending->silence_ms);
+    send_probe(pending);
+    await_silence(pending, std::min(2 * pending->silence_ms, LAST_PROBE_MS));
     return G_SOURCE_REMOVE;
 }
 
 // Runs in the context of the questions. At the deadline the calls end by themselves.
 static void await_answer(pending_check *pending) {
     send_question(pending);
-    await_silence(pending, FIRST_REPEAT_MS);
+    await_silence(pending, FIRST_PROBE_MS);
     while (!has_ended(*pending))
         (void)g_main_context_iteration(client_context, TRUE);  // Whatever ran, the answer decides.
     end_silence(pending);
@@ -150,7 +183,7 @@ static void await_answer(pending_check *pending) {
 
 static bool ask_once(const question &asked, polkit_answer *out_answer, GError **error) {
     g_autoptr(GCancellable) cancellable = g_cancellable_new();
-    pending_check pending = {&asked, cancellable, nullptr, 0, 0, nullptr, nullptr};
+    pending_check pending = {&asked, cancellable, nullptr, 0, 0, 0, nullptr, nullptr};
     gboolean is_authorized = FALSE;
     gboolean needs_password = FALSE;
 

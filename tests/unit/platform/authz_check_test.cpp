@@ -174,7 +174,7 @@ TEST_F(AuthzCheck, QuestionIsAskedAgainWhenItsAnswerIsLost) {
 
     EXPECT_EQ(text_from_child([] {
                   const gint64 start = g_get_monotonic_time();
-                  std::string outcome = check(own_name(), "test.lost-answer");
+                  std::string outcome = check(own_name(), "test.lost-answers");
                   if (g_get_monotonic_time() - start > 10 * G_USEC_PER_SEC)
                       outcome += ", late";
                   // Later questions are asked as usual.
@@ -183,6 +183,46 @@ TEST_F(AuthzCheck, QuestionIsAskedAgainWhenItsAnswerIsLost) {
                   say(outcome);
               }),
               "1 1");
+}
+
+// It would work on every repetition, and be late for the next question.
+TEST_F(AuthzCheck, SlowPolkitIsAskedOnce) {
+    const fake_polkit polkit;
+    ASSERT_TRUE(polkit.ready());
+
+    EXPECT_EQ(text_from_child([] {
+                  std::string outcome = check(own_name(), "test.late");
+                  outcome += " " + check(own_name(), "test.late");
+                  outcome += " " + check(own_name(), "test.questions");
+                  say(outcome);
+              }),
+              "1 1 0 authz 2 cannot check action test.questions: 3 questions");
+}
+
+TEST_F(AuthzCheck, SilentPolkitIsNotAskedMoreOftenThanItIsProbed) {
+    const fake_polkit polkit;
+    ASSERT_TRUE(polkit.ready());
+
+    EXPECT_EQ(text_from_child([] {
+                  std::string outcome = check_within(600, "test.silent");
+                  outcome += " " + check(own_name(), "test.questions");
+                  say(outcome);
+              }),
+              "0 authz 4 cannot check action test.silent: no answer in time "
+              "0 authz 2 cannot check action test.questions: 3 questions");
+}
+
+// Several probes wait behind the question, and the answer of each tells of the same loss.
+TEST_F(AuthzCheck, LostAnswerOfASlowPolkitIsAskedForOnce) {
+    const fake_polkit polkit;
+    ASSERT_TRUE(polkit.ready());
+
+    EXPECT_EQ(text_from_child([] {
+                  std::string outcome = check(own_name(), "test.late-in-vain");
+                  outcome += " " + check(own_name(), "test.questions");
+                  say(outcome);
+              }),
+              "1 0 authz 2 cannot check action test.questions: 3 questions");
 }
 
 TEST_F(AuthzCheck, FrozenPolkitIsLeftAtTheDeadline) {

@@ -23,6 +23,7 @@ static constexpr const char *INTERFACE_XML =
     "<arg type='s' name='cancellation_id' direction='in'/>"
     "<arg type='(bba{ss})' name='result' direction='out'/>"
     "</method>"
+    "<property type='s' name='BackendVersion' access='read'/>"
     "</interface></node>";
 
 static const std::string UNIT_PREFIX = "com.zintor.privane-system.";
@@ -31,7 +32,8 @@ static const std::string FORM_PREFIX = "test.form.";
 struct service {
     int ready_fd;
     bool mortal;
-    bool was_silent;
+    int questions;
+    int lost_answers;
 };
 
 static void answer(GDBusMethodInvocation *call, bool allowed, bool challenge) {
@@ -47,11 +49,30 @@ static void answer_with_error(GDBusMethodInvocation *call, const std::string &te
                                                text.c_str());
 }
 
-// As if the bus had lost the first answer.
-static void answer_second(service *self, GDBusMethodInvocation *call) {
-    if (self->was_silent)
+// As if the bus had lost the first answers.
+static void answer_third(service *self, GDBusMethodInvocation *call) {
+    if (self->lost_answers == 2)
         answer(call, true, false);
-    self->was_silent = true;
+    else
+        self->lost_answers++;
+}
+
+// A rule that takes its time: meanwhile nothing else is answered.
+static void be_slow() {
+    g_usleep(1300 * 1000);
+}
+
+static void answer_late(GDBusMethodInvocation *call) {
+    be_slow();
+    answer(call, true, false);
+}
+
+// As if the bus had lost the first answer of a slow polkit.
+static void answer_late_in_vain(service *self, GDBusMethodInvocation *call) {
+    be_slow();
+    if (self->lost_answers > 0)
+        answer(call, true, false);
+    self->lost_answers++;
 }
 
 static void answer_last(GDBusConnection *bus, GDBusMethodInvocation *call) {
@@ -156,6 +177,7 @@ static void on_question(GDBusConnection *bus, service *self, GVariant *question,
     g_variant_get_child(question, 1, "&s", &action);
     const std::string name = action;
 
+    self->questions++;
     if (name == "test.allowed" || (name == "test.last-question" && !self->mortal))
         answer(call, true, false);
     else if (name == "test.refused")
@@ -170,8 +192,14 @@ static void on_question(GDBusConnection *bus, service *self, GVariant *question,
         answer_with_error(call, describe(question));
     else if (name.rfind(FORM_PREFIX, 0) == 0)
         answer_in_form(bus, call, FORMS[std::stoul(name.substr(FORM_PREFIX.size()))]);
-    else if (name == "test.lost-answer")
-        answer_second(self, call);
+    else if (name == "test.lost-answers")
+        answer_third(self, call);
+    else if (name == "test.late")
+        answer_late(call);
+    else if (name == "test.late-in-vain")
+        answer_late_in_vain(self, call);
+    else if (name == "test.questions")
+        answer_with_error(call, std::to_string(self->questions) + " questions");
     else if (name == "test.last-answer")
         answer_last(bus, call);
     else if (name == "test.last-question")
@@ -185,6 +213,11 @@ static void on_call(GDBusConnection *bus, const char *, const char *, const char
     on_question(bus, static_cast<service *>(data), arguments, call);
 }
 
+static GVariant *on_property(GDBusConnection *, const char *, const char *, const char *,
+                             const char *, GError **, void *) {
+    return g_variant_new_string("1");
+}
+
 static bool request_name(GDBusConnection *bus, GError **error) {
     g_autoptr(GVariant) reply = g_dbus_connection_call_sync(
         bus, "org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus", "RequestName",
@@ -194,7 +227,7 @@ static bool request_name(GDBusConnection *bus, GError **error) {
 }
 
 static bool serve(service *self, GError **error) {
-    static const GDBusInterfaceVTable functions = {on_call, nullptr, nullptr, {}};
+    static const GDBusInterfaceVTable functions = {on_call, on_property, nullptr, {}};
     const auto flags =
         static_cast<GDBusConnectionFlags>(G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_CLIENT |
                                           G_DBUS_CONNECTION_FLAGS_MESSAGE_BUS_CONNECTION);
@@ -221,7 +254,7 @@ fake_polkit::fake_polkit(end its_end) {
     process_ = fork();
     if (process_ == 0) {
         (void)prctl(PR_SET_PDEATHSIG, SIGKILL);
-        service self = {ends[1], its_end == end::MORTAL, false};
+        service self = {ends[1], its_end == end::MORTAL, 0, 0};
         g_autoptr(GError) error = nullptr;
         if (!serve(&self, &error))
             g_printerr("fake polkit: %s\n", error != nullptr ? error->message : "not ready");

@@ -33,7 +33,10 @@ class private_bus {
 //   test.undeclared    the error of the real polkit for an action that it does not know
 //   test.question      an error whose text shows the question as it came
 //   test.silent        nothing
-//   test.lost-answer   nothing the first time, then yes
+//   test.lost-answers  nothing the first two times, then yes
+//   test.late          yes, after 1.3 s in which nothing is answered
+//   test.late-in-vain  likewise, but the first answer does not arrive
+//   test.questions     an error whose text tells how many were asked, this one included
 //   test.last-answer   yes, and exits
 //   test.last-question exits without an answer where it is a mortal one, else yes
 //
