@@ -34,8 +34,9 @@ static void on_bus_acquired(GDBusConnection *connection, const char *, gpointer 
 
     state->connection = connection;
     // Before there is anything to call.
-    read_buffer_guard(connection);
-    intake_guard(connection, OBJECT_PATH, privane_system__interface_info());
+    GDBusInterfaceInfo *interface = privane_system__interface_info();
+    read_buffer_guard(connection, interface);
+    intake_guard(connection, OBJECT_PATH, interface);
     (void)g_dbus_interface_skeleton_export(G_DBUS_INTERFACE_SKELETON(state->skeleton), connection,
                                            OBJECT_PATH, nullptr);
     g_message("Policy Server now registered with the name '%s' and object '%s'", BUS_NAME,

@@ -3,6 +3,7 @@
 #include "service/read_buffer.h"
 
 #include <algorithm>
+#include <cstring>
 #include <string_view>
 
 static constexpr const char *ZEROS_INTERFACE = "com.zintor.PrivaneSystem";
@@ -14,30 +15,42 @@ static constexpr std::string_view secret_members[] = {
     "ChpasswdUser",  "Digest",     "ModifyUser",
 };
 
-// More than the header of a call takes beyond that of the zeros: the longest names that the bus
-// allows are 255 bytes, and there are four of them.
+// Those that GDBus answers for every object; no password goes with them.
+static constexpr const char *STANDARD_INTERFACES = "org.freedesktop.DBus.";
+
+// More than the header of a call takes beyond its path and beyond that of the zeros: the longest
+// names that the bus allows are 255 bytes, and there are four of them.
 static constexpr gsize HEADER_ROOM = 2048;
 
 // A short text of a list takes up to four times as much in a message as in its value.
 static constexpr gsize WIRE_FACTOR = 4;
 
 struct read_buffer {
-    gsize under_way;  // zeros that were sent and have not come back
-    gsize wanted;     // by calls that came meanwhile
+    GDBusInterfaceInfo *interface;  // a reference
+    gsize under_way;                // zeros that were sent and have not come back
+    gsize wanted;                   // by calls that came meanwhile
 };
 
-static bool carries_secret(GDBusMessage *message) {
+static bool may_carry_secret(const read_buffer *self, GDBusMessage *message) {
     const char *member = g_dbus_message_get_member(message);
-    return g_dbus_message_get_message_type(message) == G_DBUS_MESSAGE_TYPE_METHOD_CALL &&
-           member != nullptr &&
-           std::find(std::begin(secret_members), std::end(secret_members), member) !=
-               std::end(secret_members);
+    if (g_dbus_message_get_message_type(message) != G_DBUS_MESSAGE_TYPE_METHOD_CALL ||
+        member == nullptr)
+        return false;
+    if (std::find(std::begin(secret_members), std::end(secret_members), member) !=
+        std::end(secret_members))
+        return true;
+    const char *interface = g_dbus_message_get_interface(message);
+    const bool is_standard =
+        interface != nullptr && g_str_has_prefix(interface, STANDARD_INTERFACES);
+    return !is_standard && g_dbus_interface_info_lookup_method(self->interface, member) == nullptr;
 }
 
 static gsize length_of(GDBusMessage *message) {
     GVariant *body = g_dbus_message_get_body(message);
     const gsize size = body != nullptr ? g_variant_get_size(body) : 0;
-    return std::min(size * WIRE_FACTOR + HEADER_ROOM, READ_BUFFER_OVERWRITTEN);
+    const char *path = g_dbus_message_get_path(message);
+    const gsize header = HEADER_ROOM + (path != nullptr ? std::strlen(path) : 0);
+    return std::min(size * WIRE_FACTOR + header, READ_BUFFER_OVERWRITTEN);
 }
 
 static void send_zeros(read_buffer *self, GDBusConnection *connection) {
@@ -70,7 +83,7 @@ static GDBusMessage *on_message(GDBusConnection *connection, GDBusMessage *messa
     // Outgoing messages come from other threads, and are nobody's here.
     if (incoming == FALSE)
         return message;
-    if (carries_secret(message))
+    if (may_carry_secret(self, message))
         self->wanted = std::max(self->wanted, length_of(message));
     const bool has_returned = are_own_zeros(connection, message);
     if (has_returned)
@@ -83,6 +96,14 @@ static GDBusMessage *on_message(GDBusConnection *connection, GDBusMessage *messa
     return nullptr;
 }
 
-void read_buffer_guard(GDBusConnection *connection) {
-    (void)g_dbus_connection_add_filter(connection, on_message, g_new0(read_buffer, 1), g_free);
+static void read_buffer_free(void *data) {
+    auto *self = static_cast<read_buffer *>(data);
+    g_dbus_interface_info_unref(self->interface);
+    g_free(self);
+}
+
+void read_buffer_guard(GDBusConnection *connection, GDBusInterfaceInfo *interface) {
+    auto *self = g_new0(read_buffer, 1);
+    self->interface = g_dbus_interface_info_ref(interface);
+    (void)g_dbus_connection_add_filter(connection, on_message, self, read_buffer_free);
 }

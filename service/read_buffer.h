@@ -3,8 +3,9 @@
 // GDBus reads all messages of a connection into one buffer and never clears it: the end of a
 // message stays there until another one is as long. Behind a call that carries a password, whether
 // it is served or refused, the service therefore sends a message of zeros to itself, which goes
-// through the same buffer. Of these there is one at a time, so that nobody can fill the bus's queue
-// with them.
+// through the same buffer. A call that names no method may have been meant for one with a password,
+// and is treated alike. Of the zeros there is one message at a time, so that nobody can fill the
+// bus's queue with them.
 #pragma once
 
 #include <gio/gio.h>
@@ -13,5 +14,5 @@
 inline constexpr gsize READ_BUFFER_OVERWRITTEN = gsize{64} * 1024;
 
 // For as long as the connection lives. To be called before intake_guard, whose filter lets through
-// neither refused calls nor the zeros.
-void read_buffer_guard(GDBusConnection *connection);
+// neither refused calls nor the zeros. The interface is the one that is exported.
+void read_buffer_guard(GDBusConnection *connection, GDBusInterfaceInfo *interface);

@@ -5,8 +5,9 @@ socket itself.
 """
 import os
 import socket
+from contextlib import contextmanager
 from dataclasses import dataclass
-from typing import Any
+from typing import Any, Iterator, Sequence
 
 from gi.repository import Gio, GLib
 
@@ -38,8 +39,24 @@ class Message:
         return self.body
 
 
+@contextmanager
+def as_user(uid: int, groups: Sequence[int] = ()) -> Iterator[None]:
+    """What is connected meanwhile is, to the other side, the user's; this process goes on as root
+    with its real user."""
+    old = os.getgroups()
+    os.setgroups(groups)
+    os.setegid(uid)
+    os.seteuid(uid)
+    try:
+        yield
+    finally:
+        os.seteuid(0)
+        os.setegid(0)
+        os.setgroups(old)
+
+
 class Wire:
-    """A connection of root that gets the service's signals."""
+    """A connection of the effective user that gets the service's signals."""
 
     def __init__(self) -> None:
         self._socket = socket.socket(socket.AF_UNIX, socket.SOCK_STREAM)
@@ -52,7 +69,7 @@ class Wire:
         self._ask_bus("AddMatch", GLib.Variant("(s)", (f"type='signal',interface='{INTERFACE}'",)))
 
     def _authenticate(self) -> None:
-        uid = str(os.getuid()).encode().hex().encode()
+        uid = str(os.geteuid()).encode().hex().encode()
         self._socket.sendall(b"\0AUTH EXTERNAL " + uid + b"\r\n")
         answer = self._socket.recv(4096)
         assert answer.startswith(b"OK "), answer
@@ -94,8 +111,15 @@ class Wire:
         """Sends a call to the service without waiting for its reply; the call's serial."""
         return self._send(NAME, PATH, INTERFACE, member, GLib.Variant(f"({signature})", arguments))
 
-    def receive(self) -> Message:
+    def receive(self, seconds: float = CALL_TIMEOUT) -> Message:
         """The next message of the service, waited for; or of the bus, when the service is gone."""
+        self._socket.settimeout(seconds)
+        try:
+            return self._next()
+        finally:
+            self._socket.settimeout(CALL_TIMEOUT)
+
+    def _next(self) -> Message:
         while True:
             raw = self._receive()
             if raw.get_member() in ("NameAcquired", "NameLost"):

@@ -25,8 +25,9 @@ from harness.service import Service
 from harness.stage import Stage
 from harness.stage_fixtures import run_stage
 from harness.syslog_socket import SyslogSocket
+from harness.wire import as_user
 from method_effects import OTHER_ARGUMENTS, Evidence, require_effect
-from pipeline import Answer, Call, Pipeline, as_user, exchange
+from pipeline import Answer, Call, Pipeline, exchange
 from polkit_control import NAME as POLKIT, NonsensePolkit, PolkitControl
 from surroundings import differences, world
 

@@ -26,9 +26,10 @@ from harness.passwords import OLD_HASH
 from harness.service import Service
 from harness.stage import Stage
 from harness.syslog_socket import SyslogSocket
+from harness.wire import as_user
 from harness.world import World
 from hostile_calls import METHOD, Generator, methods_of
-from pipeline import Answer, Call, Pipeline, as_user, exchange
+from pipeline import Answer, Call, Pipeline, exchange
 from surroundings import differences, world
 
 PASSWD_TEXT = STANDARD_PASSWD + """\

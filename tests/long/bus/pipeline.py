@@ -1,10 +1,8 @@
 """tests/long/bus/pipeline.py: bus connections that send many calls before the first is answered."""
 import itertools
-import os
 import select
-from contextlib import contextmanager
 from dataclasses import dataclass, field
-from typing import Any, Callable, Iterable, Iterator, Sequence
+from typing import Any, Callable, Iterable, Sequence
 
 from gi.repository import Gio, GLib
 
@@ -64,31 +62,8 @@ def _answer(message: Gio.DBusMessage) -> Answer:
     return Answer(signature, BusError(message.get_error_name(), body[0]), message)
 
 
-@contextmanager
-def as_user(uid: int, groups: Sequence[int] = ()) -> Iterator[None]:
-    """What is connected meanwhile is, to the other side, the user's; this process goes on as root
-    with its real user."""
-    old = os.getgroups()
-    os.setgroups(groups)
-    os.setegid(uid)
-    os.seteuid(uid)
-    try:
-        yield
-    finally:
-        os.seteuid(0)
-        os.setegid(0)
-        os.setgroups(old)
-
-
 class Pipeline(Wire):
     """A connection of the effective user, which gets no signals of the service."""
-
-    def _authenticate(self) -> None:
-        uid = str(os.geteuid()).encode().hex().encode()
-        self._socket.sendall(b"\0AUTH EXTERNAL " + uid + b"\r\n")
-        answer = self._socket.recv(4096)
-        assert answer.startswith(b"OK "), answer
-        self._socket.sendall(b"BEGIN\r\n")
 
     def _ask_bus(self, member: str, body: GLib.Variant | None = None) -> None:
         if member != "AddMatch":

@@ -17,8 +17,8 @@ from harness.bus import Bus
 from harness.deadline import wait_for
 from harness.polkit import POLICIES, actions
 from harness.sandbox import STATE, polkitd_pid
-from harness.wire import NO_CAPABILITIES
-from pipeline import Pipeline, as_user
+from harness.wire import NO_CAPABILITIES, as_user
+from pipeline import Pipeline
 
 NAME = "org.freedesktop.PolicyKit1"
 PROGRAMS = (Path("/usr/lib/polkit-1/polkitd"), Path("/usr/libexec/polkitd"))
