@@ -11,14 +11,21 @@ STATE = Path("/run/bus-sandbox")
 MARK = "bus-sandbox"
 
 
+def mounted_at(path: str) -> list[str]:
+    """Type and source of the file system on top there; none where nothing is mounted."""
+    mounts = [line.split() for line in Path("/proc/self/mountinfo").read_text().splitlines()]
+    found = [mount[mount.index("-") + 1:] for mount in mounts if mount[4] == path]
+    return found[-1][:2] if found else []
+
+
 @functools.cache
 def require_sandbox() -> None:
     """Raises unless / is a copy-on-write view in a mount namespace of its own: the service rewrites
-    the account files of the machine that it runs on."""
-    mounts = [line.split() for line in Path("/proc/self/mountinfo").read_text().splitlines()]
-    roots = [mount[mount.index("-") + 1:] for mount in mounts if mount[4] == "/"]
-    if not roots or roots[-1][:2] != ["overlay", MARK]:
+    the account files of the machine that it runs on. Its /tmp is its own, too."""
+    if mounted_at("/") != ["overlay", MARK]:
         raise RuntimeError("not in the sandbox; start the tests with tests/bus/run BUILD_DIR")
+    if mounted_at("/tmp") != ["tmpfs", "tmp"]:
+        raise RuntimeError("/tmp is the machine's own; what lies right below it cannot be shown")
 
 
 def build_directory() -> Path:

@@ -1,0 +1,160 @@
+"""tests/bus/test_polkit_slow.py: many calls at once while polkit takes its time, or hangs."""
+import time
+from typing import Iterator
+
+import pytest
+
+from harness.accounts import CLERK_UID
+from harness.bus import Bus, User, domain_error
+from harness.interface import ACTION_PREFIX
+from harness.monitor import Monitor
+from harness.polkit import hanging_polkitd, local_rules
+from harness.sandbox import fake_library
+from harness.service import Service
+from harness.service_fixtures import StartService
+from harness.wire import Wire, as_user
+
+CALLS = 10
+
+# Longer than libauthz waits before it asks once more: polkit has two questions for each call.
+RULE_SECONDS = 1.3
+SLOW_RULE = f"""
+polkit.addRule(function (action, subject) {{
+    if (action.id !== "{ACTION_PREFIX}checkuser" || subject.user !== "clerk")
+        return undefined;
+    polkit.spawn(["/bin/sleep", "{RULE_SECONDS}"]);
+    return polkit.Result.YES;
+}});
+"""
+
+# By default, with the seconds after which polkit is asked meanwhile; and of the library that has a
+# short one, in which it is asked once.
+DEADLINE = 25.0
+QUESTION_TIMES = (0, 1, 3, 7, 15)
+SHORT_DEADLINE = 0.3
+
+# Of an answer that waits for nobody.
+AT_ONCE = 1.0
+
+SILENCE = domain_error("authz", 4, "Authorization check failed: cannot check action "
+                                   f"{ACTION_PREFIX}checkuser: no answer in time")
+
+
+@pytest.fixture
+def hasty_service(start: StartService, bus: Bus) -> Iterator[Service]:
+    """With polkit deciding within the short deadline."""
+    library = fake_library("authz_short_deadline/libauthz.so.1")
+    running = start(environment={"LD_LIBRARY_PATH": str(library.parent)})
+    running.wait_registered(bus)
+    yield running
+    assert running.stop() == 0
+
+
+@pytest.fixture
+def monitor() -> Iterator[Monitor]:
+    """Of polkit's questions, and of all answers."""
+    listener = Monitor("type='method_call',member='CheckAuthorization'", "type='method_return'",
+                       "type='error'")
+    yield listener
+    listener.close()
+
+
+def call(wire: Wire, count: int) -> list[int]:
+    return [wire.send("CheckUser", "s", "root") for _ in range(count)]
+
+
+def answers(wire: Wire, count: int, seconds: float) -> list[tuple[int, object, float]]:
+    """Which call was answered, how, and how long that took since the last answer."""
+    seen, before = [], time.monotonic()
+    for _ in range(count):
+        message = wire.receive(seconds)
+        now = time.monotonic()
+        seen.append((message.reply_serial, message.answer(), now - before))
+        before = now
+    return seen
+
+
+@pytest.mark.slow
+def test_slow_polkit_is_waited_for_by_each_of_many_calls(real_service: Service, bus: Bus,
+                                                         clerk: User, privane_gid: int) -> None:
+    with as_user(CLERK_UID, [privane_gid]):
+        wire = Wire()
+    before = real_service.output()
+
+    with local_rules(bus, clerk, SLOW_RULE):
+        serials = call(wire, CALLS)
+        seen = answers(wire, CALLS, DEADLINE)
+
+    wire.close()
+    assert [(serial, answer) for serial, answer, _ in seen] == [(serial, (True,))
+                                                                for serial in serials]
+    assert min(taken for *_, taken in seen) > RULE_SECONDS / 2
+    assert real_service.output() == before
+
+
+@pytest.mark.slow
+def test_hanging_polkitd_costs_one_call_its_deadline(real_service: Service, bus: Bus,
+                                                     monitor: Monitor) -> None:
+    assert bus.call("CheckUser", "s", "root") == (True,)
+    wire = Wire()
+    before = real_service.output()
+
+    with hanging_polkitd():
+        (serial,) = call(wire, 1)
+        [(answered, answer, seconds)] = answers(wire, 1, DEADLINE + 10)
+
+    assert (answered, answer) == (serial, SILENCE)
+    assert DEADLINE - 1 < seconds < DEADLINE + 5
+    assert real_service.output() == before + [f"warning: {SILENCE.text}"]
+    # Before it, one that was answered.
+    assert questions_until_error(monitor) == 1 + len(QUESTION_TIMES)
+    (serial,) = call(wire, 1)
+    assert answers(wire, 1, AT_ONCE)[0][:2] == (serial, (True,))
+    wire.close()
+
+
+def questions_until_error(monitor: Monitor) -> int:
+    """How often polkit was asked before somebody was answered with an error."""
+    seen = monitor.until(lambda message: message.get_error_name() is not None)
+    return sum(message.get_member() == "CheckAuthorization" for message in seen)
+
+
+def test_calls_in_a_row_each_have_the_deadline(hasty_service: Service, bus: Bus) -> None:
+    assert bus.call("CheckUser", "s", "root") == (True,)
+    wire = Wire()
+    before = hasty_service.output()
+
+    with hanging_polkitd():
+        serials = call(wire, CALLS)
+        seen = answers(wire, CALLS, AT_ONCE + SHORT_DEADLINE)
+        assert [(serial, answer) for serial, answer, _ in seen] == [(serial, SILENCE)
+                                                                    for serial in serials]
+        taken = [seconds for *_, seconds in seen]
+        assert sum(taken) >= CALLS * SHORT_DEADLINE and max(taken) < AT_ONCE, taken
+    begin = time.monotonic()
+    (serial,) = call(wire, 1)
+    assert answers(wire, 1, AT_ONCE)[0][:2] == (serial, (True,))
+    assert time.monotonic() - begin < AT_ONCE
+
+    wire.close()
+    assert hasty_service.output() == before + [f"warning: {SILENCE.text}"] * CALLS
+
+
+def test_call_that_waits_when_polkit_returns_is_answered(real_service: Service, bus: Bus,
+                                                         monitor: Monitor) -> None:
+    """With all that wait behind it."""
+    assert bus.call("CheckUser", "s", "root") == (True,)
+    wire = Wire()
+    with hanging_polkitd():
+        serials = call(wire, CALLS)
+        assert wire.is_silent(QUESTION_TIMES[2] + 0.5)
+
+    seen = answers(wire, CALLS, AT_ONCE)
+    wire.close()
+    assert [(serial, answer) for serial, answer, _ in seen] == [(serial, (True,))
+                                                                for serial in serials]
+    # The one that waited asked three times, before and after it each call once.
+    messages = monitor.until(lambda message: message.get_reply_serial() == serials[-1]
+                             and message.get_body().unpack() == (True,))
+    questions = [message for message in messages if message.get_member() == "CheckAuthorization"]
+    assert len(questions) == 1 + 3 + CALLS - 1
