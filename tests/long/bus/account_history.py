@@ -66,6 +66,12 @@ class History:
                  for row in rows(self.versions[0][GROUP])}
         return {group: members for group, members in found.items() if members}
 
+    def shadowless(self) -> set[str]:
+        """The names with a passwd line and without one in shadow."""
+        in_passwd, in_shadow = ({row[0] for row in rows(self.versions[0][path])}
+                                for path in (PASSWD, SHADOW))
+        return in_passwd - in_shadow
+
     def begin(self, call: Call) -> tuple[str, int] | None:
         """Adds the versions that a call makes; None, or domain and code of its refusal."""
         member, *arguments = call

@@ -17,8 +17,8 @@ from harness.fake_authz import FakeAuthz
 from harness.service_fixtures import StartService
 from harness.syslog_socket import SyslogSocket
 from kill_load import KillLoad
-from kill_points import LEFTOVERS, KillPoints, Point
-from killed_service import KilledService
+from kill_points import CHANGES, LEFTOVERS, KillPoints, Point
+from killed_service import REMOVALS, KilledService
 from temporary_watch import TemporaryWatch
 
 # The random kills begin so often with the files as they were at first.
@@ -53,6 +53,12 @@ def chosen(points: list[Point], most: int, chance: random.Random) -> list[Point]
             2 if boundary in seen else 1)
         seen.add(boundary)
     return sorted(points, key=lambda point: ranks[point])[:most]
+
+
+def test_what_a_start_warns_of_is_a_known_leftover() -> None:
+    """Which of the changes leave lines of an account that is gone."""
+    assert {CHANGES[change][0] for change, lines in LEFTOVERS.items()
+            if "still a line in shadow" in lines} == set(REMOVALS)
 
 
 def test_kill_at_every_boundary(killed: KilledService, watch: TemporaryWatch, amount: int,

@@ -1,46 +1,40 @@
 """tests/long/bus/daemon_secrets.py: proof: no password and no replaced hash stays in the service.
 
-After each method that carries a password, done or failed, and six further calls, none of the
-service's writable memory, logs, and children's arguments and environment holds the password, nor
-the hash that it replaced. The hashes of the account files as they were read at the start stay in
-memory on purpose; the accounts of this proof are newer. One call counts once.
+After each call that carries a password, done, failed, or refused before it reached a method, and
+six further calls, none of the service's writable memory, logs, and children's arguments and
+environment holds the password, nor the hash that it replaced. The hashes of the account files as
+they were read at the start stay in memory on purpose; the accounts of this proof are newer. One
+call counts once; a third of them do not reach a method.
 """
 import os
 import random
 import signal
-import string
 import subprocess
 from collections import Counter
 from pathlib import Path
-from typing import Any, Callable, Iterator
+from typing import Any, Callable, Iterator, TypeVar
 
 import pytest
 
-from harness import process
+from harness import packaged, process
 from harness.account_model import digest_line
-from harness.bus import Bus, BusError
-from harness.changing_accounts import stored_hash
+from harness.accounts import CLERK_UID, AccountFiles
+from harness.bus import Bus
+from harness.changing_accounts import Texts, stored_hash
 from harness.deadline import wait_for
+from harness.device import Device
 from harness.fake_authz import FakeAuthz
 from harness.passwords import NEW
 from harness.sandbox import BINARY
 from harness.service_fixtures import StartService
 from harness.stage import SIGNATURES, Stage
-from harness.stage_fixtures import DIGEST_FILE
-from process_secrets import find, forms
+from harness.stage_fixtures import DIGEST_FILE, run_stage
+from harness.syslog_socket import SyslogSocket
+from refused_secrets import MEMBERS, RefusedSecrets
+from secret_search import ROOT, SYSTEM, WEB, Call, SecretSearch
 
-UNIT = Path("/usr/lib/systemd/system/privane-system.service")
-
-FURTHER_CALLS: tuple[tuple[Any, ...], ...] = (
-    ("CheckUser", "alice"), ("GetUserList",), ("GetUser", "alice"), ("CheckGroup", "users"),
-    ("GetGroupListFull",), ("GetDigestList",))
-
-# Of the web, of the system, and root: those whose hashes change.
-WEB, SYSTEM, ROOT = "carol", "ftpd", "root"
-REALM = "PRIVANE"
-
-Call = tuple[Any, ...]
-
+# Of the calls; the others reach a method.
+REFUSED_SHARE = 1 / 3
 
 def calls(secret: str, name: str) -> dict[str, Call]:
     """One for each way in which a password comes; what adds an account adds one of this name."""
@@ -93,62 +87,13 @@ BROKEN_DIGEST = ("AddUser", "AddUidUser", "ModifyUser", "ModifyUser root", "Dige
 REFUSED = ("AddUser", "AddUidUser", "AddSystemUser", "ModifyUser", "ChpasswdUser", "Digest")
 
 
-def packaged_environment() -> dict[str, str]:
-    """What the packaged unit gives the service."""
-    words = [line.removeprefix("Environment=") for line in UNIT.read_text().splitlines()
-             if line.startswith("Environment=")]
-    assert words
-    return dict(word.split("=", 1) for word in words)
-
-
-class Secrets:
-    """Makes calls, and looks for what they carried."""
+class Secrets(SecretSearch):
+    """Calls that reach their methods, but for those that the authorization or GDBus refuses."""
 
     def __init__(self, stage: Stage, authz: FakeAuthz, chance: random.Random,
                  figures: Counter[str]) -> None:
-        self._stage = stage
+        super().__init__(stage, chance, figures)
         self._authz = authz
-        self._chance = chance
-        self._figures = figures
-        self._number = 0
-        self.found: list[str] = []
-        for call in (("AddUser", WEB, self.draw(), "users", "", ""),
-                     ("AddSystemUser", SYSTEM, self.draw(), "users", [], "", ""),
-                     ("ChpasswdUser", ROOT, self.draw())):
-            assert self.call(call) is None
-
-    def draw(self) -> str:
-        """A password like no other; a few of its letters are no ASCII."""
-        text = "".join(self._chance.choices(string.ascii_letters + string.digits + "_.%+/", k=28))
-        return text[:5] + self._chance.choice(("", "ü", "€")) + text[5:]
-
-    def new_name(self) -> str:
-        self._number += 1
-        return f"u{self._number}"
-
-    def call(self, call: Call, signature: str | None = None) -> BusError | None:
-        try:
-            self._stage.bus.call(call[0], SIGNATURES[call[0]] if signature is None else signature,
-                                 *call[1:])
-        except BusError as error:
-            return error
-        return None
-
-    def look(self, what: str, *secrets: str) -> None:
-        """Makes the further calls, and notes where any of the secrets is found after them."""
-        for further in FURTHER_CALLS:
-            assert self.call(further) is None, further
-        wanted = set().union(*map(forms, secrets))
-        places = find(self._stage.service.pid, wanted)
-        told = "\n".join([*self._stage.service.output(),
-                          *(text for _, text in self._stage.syslog.texts())]).encode()
-        places += ["the log" for form in wanted if form in told]
-        words = " ".join(word for call in self._stage.calls() for word in call).encode()
-        words += b" ".join(file.read_bytes() for file in self._stage.pidof.directory.iterdir()
-                           if file.is_file())
-        places += ["a child" for form in wanted if form in words]
-        self._figures["calls"] += 1
-        self.found += [f"{what}: {place}" for place in places]
 
     def succeed(self, what: str) -> None:
         """A call that is done, and whose secret is nobody's in the end."""
@@ -223,11 +168,25 @@ def _digests_of(name: str) -> list[str]:
 def packaged_stage(stage_with_stores: Stage) -> Stage:
     """As the unit starts it."""
     stage_with_stores.stop()
-    stage_with_stores.start(**packaged_environment())
+    stage_with_stores.start(**packaged.environment())
     return stage_with_stores
 
 
+@pytest.fixture
+def guarded_stage(changing_accounts: AccountFiles, device: Device, start: StartService, bus: Bus,
+                  authz: FakeAuthz, syslog: SyslogSocket, tmp_path: Path) -> Iterator[Stage]:
+    """As the unit starts it, with polkit deciding, and with a user whom the bus lets in."""
+    texts = Texts()
+    changing_accounts.write(texts.passwd + f"clerk:x:{CLERK_UID}:{CLERK_UID}::/:/bin/false\n",
+                            texts.shadow + "clerk:!:19000:0:99999:7:0::\n",
+                            texts.group + f"clerk:x:{CLERK_UID}:\n")
+    authz.environment = packaged.environment  # type: ignore[method-assign]
+    yield from run_stage(Stage(start, bus, authz, syslog, tmp_path, fake_stores=False,
+                               others=device.fakes()))
+
+
 Trial = tuple[Callable[[Secrets, str], None], str]
+Item = TypeVar("Item")
 
 
 def all_trials() -> list[Trial]:
@@ -239,18 +198,39 @@ def all_trials() -> list[Trial]:
             *((Secrets.break_digest, what) for what in BROKEN_DIGEST)]
 
 
+def shuffled_for_ever(all_of_them: list[Item], chance: random.Random) -> Iterator[Item]:
+    while True:
+        yield from chance.sample(all_of_them, len(all_of_them))
+
+
+def require_none_found(search: SecretSearch, most: int = 1) -> None:
+    assert len(search.found) < most, "\n".join(search.found)
+
+
 def test_no_secret_stays(packaged_stage: Stage, authz: FakeAuthz, amount: int,
                          chance: random.Random, figures: Counter[str]) -> None:
     secrets = Secrets(packaged_stage, authz, chance, figures)
-    trials: Iterator[Trial] = iter(())
+    trials = shuffled_for_ever(all_trials(), chance)
+    while figures["calls"] < amount * (1 - REFUSED_SHARE):
+        make, what = next(trials)
+        make(secrets, what)
+        require_none_found(secrets, 10)
+    require_none_found(secrets)
+
+
+def test_no_secret_of_a_call_stays_that_reaches_no_method(
+        guarded_stage: Stage, device: Device, privane_gid: int, amount: int,
+        chance: random.Random, figures: Counter[str]) -> None:
+    secrets = RefusedSecrets(guarded_stage, device, privane_gid, chance, figures)
+    trials = shuffled_for_ever([(way, member) for way in RefusedSecrets.WAYS for member in MEMBERS],
+                               chance)
     while figures["calls"] < amount:
-        trial = next(trials, None)
-        if trial is None:
-            trials = iter(chance.sample(all_trials(), len(all_trials())))
-            continue
-        trial[0](secrets, trial[1])
-        assert len(secrets.found) < 10, "\n".join(secrets.found)
-    assert not secrets.found, "\n".join(secrets.found)
+        way, member = next(trials)
+        way(secrets, member)
+        figures["calls_without_a_method"] += 1
+        require_none_found(secrets, 10)
+    require_none_found(secrets)
+    assert figures["calls_without_a_method"] > 0
 
 
 def test_search_finds_what_is_there(packaged_stage: Stage, authz: FakeAuthz,
@@ -294,7 +274,7 @@ def test_no_core_dump_can_be_had(start: StartService, authz: FakeAuthz, bus: Bus
     for file in CRASH_FOLDER.iterdir():
         file.unlink()
 
-    service = start(environment=authz.environment() | packaged_environment(), wrapper=unlimited)
+    service = start(environment=authz.environment() | packaged.environment(), wrapper=unlimited)
     service.wait_registered(bus)
     assert Path(f"/proc/{service.pid}/exe").resolve() == Path(BINARY)
     has_core = dies_with_a_core(service.started)

@@ -127,12 +127,13 @@ class KillPoints:
         return self._killed.fresh | {path: (b"evil:x:0:0::/root:/bin/sh\nhalf a li", seen)
                                      for path in TEMPORARIES}
 
-    def _crash(self, first: Call | None, call: Call, name: str, number: int) -> dict[Any, Any]:
+    def _crash(self, first: Call | None, call: Call, name: str,
+               number: int) -> tuple[dict[Any, Any], Call]:
         history = self._killed.start_on(self._killed.fresh)
         if first is not None:
             assert self._killed.make(history, first) is None
         self._kill_in(history, call, name, number)
-        return save_files()
+        return save_files(), call
 
     def all_points(self) -> list[Point]:
         return [Point(change, call, number, state)
@@ -140,11 +141,12 @@ class KillPoints:
                 for call, count in (*counts.items(), (ANSWERED, 1))
                 for number in range(1, count + 1) for state in STATES]
 
-    def _files(self, point: Point) -> dict[Any, Any]:
+    def _files(self, point: Point) -> tuple[dict[Any, Any], Call | None]:
+        """And the call that was cut off in them."""
         if point.state == "clean":
-            return self._killed.fresh
+            return self._killed.fresh, None
         if point.state == "leftover":
-            return self._leftover
+            return self._leftover, None
         return self._crashed[hash_of(point) % len(self._crashed)]
 
     def _kill_in(self, history: History, call: Call, name: str, number: int) -> None:
@@ -174,7 +176,7 @@ class KillPoints:
 
     def _strike(self, point: Point) -> set[str]:
         call = CHANGES[point.change]
-        history = self._killed.start_on(self._files(point))
+        history = self._killed.start_on(*self._files(point))
         self._kill_in(history, call, point.call, point.number)
         recovered = self._killed.recover(call)
         self._killed.stop()

@@ -20,6 +20,14 @@ from kept_files import (BOOT_BLOCK, BOOT_CONFIG, BOOT_COPY, BOOT_LOCK, PARAMETER
 
 SIGNATURES = {method.member: method.signature for method in METHODS}
 
+# Cut off between the files, they leave members without an account, or an account without a shadow
+# line. The next start warns of nothing else.
+REMOVALS = ("RemoveUser",)
+ADDITIONS = ("AddUser", "AddUidUser", "AddSystemUser")
+
+# Of an account that is half gone: a group that lists it. Of one that is half there: no group.
+HalfDone = tuple[str, str | None]
+
 
 def make_files(files: AccountFiles) -> None:
     """A user and a group of every type, known to the web server, and a parameter and a boot block,
@@ -48,6 +56,7 @@ class KilledService:
                  syslog: SyslogSocket, files: AccountFiles) -> None:
         self._start = start
         self._environment = authz.environment()
+        self._half_done: set[HalfDone] = set()
         self.bus = bus
         self.syslog = syslog
         self.hashes = Hashes()
@@ -66,11 +75,13 @@ class KilledService:
         self.service = self._start(environment=self._environment)
         self.service.wait_registered(self.bus)
 
-    def start_on(self, saved: dict[Any, Any]) -> History:
-        """With these files."""
+    def start_on(self, saved: dict[Any, Any], cut_off: Call | None = None) -> History:
+        """With these files, as this call left them, or a sound service."""
         restore_files(saved)
+        self._half_done = set()
         history = History(self.hashes)
         self.start()
+        self._check_warnings(history, cut_off)
         return history
 
     def restart_on(self, saved: dict[Any, Any]) -> History:
@@ -118,7 +129,7 @@ class KilledService:
         """Starts the service on what a kill left, and makes the killed call again."""
         history = History(self.hashes)
         self.start()
-        self._check_warnings(history)
+        self._check_warnings(history, call)
         assert self.bus.call("GetUserList") == (list(history.model.users),)
         if call is None:
             return history
@@ -127,12 +138,25 @@ class KilledService:
             assert any(same_error(error, refusal) for refusal in REPEATED), (call, error)
         return history
 
-    def _check_warnings(self, history: History) -> None:
-        """Members without an account are told as the service starts."""
-        told = [text for _, text in self.syslog.texts() if text.startswith("Group '")]
-        wanted = history.ghosts()
-        assert len(told) == len(wanted), (told, wanted)
-        for text in told:
+    def _check_warnings(self, history: History, cut_off: Call | None) -> None:
+        """The start tells of all that is half done, and of nothing else; and what was not half done
+        before is so by the call that was cut off."""
+        told = [text for _, text in self.syslog.texts()]
+        told += [line for line in self.service.output() if not line.startswith("message: ")]
+        ghosts, shadowless = history.ghosts(), history.shadowless()
+        bare = {f"Failed to parse user '{name}': no corresponding shadow entry was found for "
+                f"'{name}'" for name in shadowless}
+        assert bare <= set(told) and len(told) == len(bare) + len(ghosts), (told, ghosts, bare)
+        for text in set(told) - bare:
+            assert text.startswith("Group '"), text
             group = text.split("'")[1]
-            assert group in wanted and text.split("'")[3] in wanted[group], (text, wanted)
-            assert len(wanted[group]) == 1 or f"{len(wanted[group])} members" in text, text
+            assert group in ghosts and text.split("'")[3] in ghosts[group], (text, ghosts)
+            assert len(ghosts[group]) == 1 or f"{len(ghosts[group])} members" in text, text
+
+        half_done: set[HalfDone] = {(name, group) for group in ghosts for name in ghosts[group]}
+        half_done |= {(name, None) for name in shadowless}
+        for name, group in half_done - self._half_done:
+            causes = ADDITIONS if group is None else REMOVALS
+            assert cut_off is not None and cut_off[0] in causes and cut_off[1] == name, (
+                f"{told} is not left by {cut_off}")
+        self._half_done = half_done

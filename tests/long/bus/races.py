@@ -1,10 +1,11 @@
 """tests/long/bus/races.py: callers that vanish, and others that write the account files.
 
-A trial is one connection that is made to be left, or one change that somebody races with; 0 of the
-refused ones may do anything.
+A trial is one connection that is made to be left, one change that another program races with, or
+one service that another one follows; 0 of the refused ones may do anything.
 """
 import json
 import random
+import signal
 import subprocess
 import threading
 import time
@@ -35,8 +36,12 @@ from other_writers import Outsider, Reader
 from surroundings import differences, world
 
 # Of the trials; those of the refused callers are the rest.
-ALLOWED_SHARE, WRITERS_SHARE = 0.04, 0.04
-SINGLE_TRIALS = 3
+ALLOWED_SHARE, WRITERS_SHARE, INSTANCES_SHARE = 0.04, 0.04, 0.01
+SINGLE_TRIALS = 2
+
+# Changes made until so many of them were raced with.
+CHANGES_TO_A_RACE = 20
+LOST = "/etc/passwd was changed by another program; its changes are lost"
 
 RACERS = 3
 WARNING = "warning: Authorization check failed: "
@@ -87,7 +92,8 @@ def share(amount: int, part: float) -> int:
 
 def rest(amount: int) -> list[int]:
     """The trials of each racer."""
-    others = share(amount, ALLOWED_SHARE) + share(amount, WRITERS_SHARE) + SINGLE_TRIALS
+    others = SINGLE_TRIALS + sum(share(amount, part) for part in (
+        ALLOWED_SHARE, WRITERS_SHARE, INSTANCES_SHARE))
     left = max(RACERS, amount - others)
     return [left // RACERS + (number < left % RACERS) for number in range(RACERS)]
 
@@ -283,19 +289,24 @@ def test_another_writer(stage: Stage, amount: int, figures: Counter[str]) -> Non
     """The service is the only writer, and says so where another one comes: but what either
     writes, it writes whole."""
     outsider, reader = Outsider(), Reader()
-    names = [f"both{number}" for number in range(share(amount, WRITERS_SHARE))]
+    wanted = share(amount, WRITERS_SHARE)
+    changes = raced = 0
     try:
-        for name in names:
+        while raced < wanted and changes < CHANGES_TO_A_RACE * wanted:
+            name, before = f"both{changes}", outsider.changes
             stage.bus.call("AddUser", "sssss", name, "secret", "clerk", "privane-viewer", "")
             stage.bus.call("RemoveUser", "s", name)
-            figures["trials"] += 1
+            changes += 1
+            raced += outsider.changes > before
     finally:
         outsider.end()
         reader.end()
-    assert outsider.changes > 3 and reader.looks > 3
+    assert raced >= wanted, (raced, changes)
+    assert reader.looks > 3
     told = [text for _, text in stage.syslog.texts()]
-    lost = "/etc/passwd was changed by another program; its changes are lost"
-    assert told.count(lost) > 0
+    assert told.count(LOST) > 0
+    figures["trials"] += raced
+    figures["trials_with_another_writer"] += raced
     figures["changes_of_another"] += outsider.changes
     figures["looks"] += reader.looks
     # One more change of the service's own, and the files are those of its database.
@@ -306,33 +317,51 @@ def test_another_writer(stage: Stage, amount: int, figures: Counter[str]) -> Non
     assert is_there("last") == (True,) * 3
 
 
-def test_second_instance(stage: Stage, start: Callable[..., Service], bus: Bus,
-                         chance: random.Random, amount: int, figures: Counter[str]) -> None:
-    """It waits for the name and touches nothing; when the first is gone it serves from the files
-    as they were at its start, and warns before it writes."""
-    first = bus.owner()
+def end(service: Service, number: signal.Signals) -> None:
+    service.kill(number)
+    assert service.wait(5) == (-number if number == signal.SIGKILL else 0)
+
+
+def follow(stage: Stage, first: Service, second: Service, number: signal.Signals) -> None:
+    """The second waits for the name and touches nothing; when the first is gone it serves from the
+    files as they were at its start, and warns before it writes."""
+    bus, owner = stage.bus, stage.bus.owner()
     before = world(stage.cfgstore)
-    second = start(environment=stage.environment)
     wait_for("the second in the queue", lambda: len(bus.queue()) == 2)
     after = world(stage.cfgstore)
     assert (after.files, after.folders["/etc"]) == (before.files, before.folders["/etc"])
-    assert bus.owner() == first
+    assert bus.owner() == owner
 
     bus.call("AddUser", "sssss", "early", "secret", "clerk", "privane-viewer", "")
     require_agreement()
-    stage.service.stop()
+    stage.syslog.forget()
+    end(first, number)
     second.wait_registered(bus)
-    assert (bus.call("CheckUser", "s", "early"), "early" in PASSWD.read_text()) == ((False,), True)
+    assert (bus.call("CheckUser", "s", "early"), is_there("early")) == ((False,), (True,) * 3)
     bus.call("AddUser", "sssss", "late", "secret", "clerk", "privane-viewer", "")
     users, *_ = require_agreement()
     assert bus.call("GetUserList") == (users,)
-    assert "/etc/passwd was changed by another program; its changes are lost" in [
-        text for _, text in stage.syslog.texts()]
-    assert second.stop() == 0
+    assert (is_there("early"), is_there("late")) == ((False,) * 3, (True,) * 3)
+    assert LOST in [text for _, text in stage.syslog.texts()]
+    bus.call("RemoveUser", "s", "late")
+
+
+def test_second_instance(stage: Stage, start: Callable[..., Service], chance: random.Random,
+                         amount: int, figures: Counter[str]) -> None:
+    serving = stage.service
+    for _ in range(share(amount, INSTANCES_SHARE)):
+        second = start(environment=stage.environment)
+        follow(stage, serving, second, chance.choice((signal.SIGTERM, signal.SIGINT, signal.SIGHUP,
+                                                      signal.SIGKILL)))
+        serving = second
+        figures["trials"] += 1
+        figures["trials_with_two_instances"] += 1
+    assert serving.stop() == 0
     stage.start()
-    figures["trials"] += 1
 
 
 def test_all_was_tried(figures: Counter[str], amount: int) -> None:
     assert figures["trials"] >= amount
     assert figures["calls_arrived"] > 0 and figures["gone_when_asked_for"] > 0
+    assert figures["trials_with_another_writer"] >= share(amount, WRITERS_SHARE)
+    assert figures["trials_with_two_instances"] >= share(amount, INSTANCES_SHARE)

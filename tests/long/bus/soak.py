@@ -4,12 +4,12 @@
 
 64 connections call methods of every family for so many seconds, drop off in the middle of calls and
 come back. Meanwhile one of them adds, changes and removes accounts and groups, and the tools that
-the service runs fail, take their time, die of signals or print 10 MB. For a fifth of the time
-polkit decides. In the end the account files hold what the calls made of them, and the service is
-the same process with the same descriptors, no child left over, and no larger than after a fifth.
+the service runs fail, take their time, die of signals, print 10 MB, or hang. For a fifth of the
+time polkit decides. From the first fifth to the end the service is the same process with the same
+descriptors, no child left over, and hardly larger; and the files hold what the calls made of them.
 
-Its size is looked at when nobody calls and after a call that is too large: the service gives freed
-memory back then, so that what is measured is what it holds.
+It is looked at again and again when nobody calls, and after a call that is too large: the service
+gives freed memory back then, so that what is measured is what it holds.
 """
 import os
 import random
@@ -20,196 +20,37 @@ from pathlib import Path
 from typing import Any, Callable, Iterator
 
 import pytest
-from gi.repository import Gio, GLib
 
 from harness import packaged, process
-from harness.account_model import Refused
 from harness.accounts import AccountFiles
-from harness.bus import INTERFACE, NAME, PATH, Bus, BusError, domain_error, error_of
-from harness.deadline import wait_for
-from harness.device import LLDPCLI, RUNNERS, Device
+from harness.bus import Bus, error_of
+from harness.device import LLDPCLI, Device
 from harness.fake_authz import FakeAuthz
 from harness.modelled_stage import ModelledStage
 from harness.passwords import MARK
 from harness.service import Service
-from harness.stage import SIGNATURES, Stage
+from harness.stage import Stage
 from harness.syslog_socket import SyslogSocket
+from soak_callers import PATIENCE, Caller, Changer, Sandglass
+from soak_tools import TEN_MEGABYTES, SoakTools
 
 CONNECTIONS = 64
-PATIENCE = 60.0
 
 GROWTH_KIB = 256
 TOO_LARGE = 5 << 20
-TEN_MEGABYTES = b"x" * (10 << 20)
 
-# Accounts and groups that the changer has at most, so that the files do not grow.
-ACCOUNTS = 12
+# After the first fifth; a tool hangs after the first of them, and in a long run once more.
+LOOKS = 10
+LOOKS_BETWEEN_HANGS = 5
+LONG_SECONDS = 600
+HANG_SECONDS, LONG_HANG_SECONDS = 5, 20
 
-# A connection drops off at one call in so many.
-CALLS_TO_A_DISCONNECT = 40
-
-# A tool behaves in one way for so long. It is run by a caller in one call of many, so that waiting
-# for it does not take all the time.
+# A tool behaves in one way for so long.
 MANNERS_SECONDS = 0.5
-CALLS_TO_A_TOOL = 60
-MANNERS = (":", ":", "sleep 0.05", "sleep 0.3", "kill -9 $PPID", "kill -15 $PPID")
 
-TOOLS = tuple((member, arguments) for member, (_, arguments) in RUNNERS.items())
-QUESTIONS: tuple[tuple[str, tuple[Any, ...]], ...] = (
-    ("CheckUser", ("root",)), ("CheckUser", ("nosuch",)), ("CheckGroup", ("users",)),
-    ("GetUser", ("alice",)), ("GetUser", ("nosuch",)), ("GetUserList", ()), ("GetGroupList", ()),
-    ("GetGroup", ("users",)), ("GetGroup", ("nosuch",)), ("GetGroupListFull", ()),
-    ("GetDigestList", ()), ("AuthUserBasic", ("alice", "wrong")), ("GetSlabinfo", ()),
-    ("ReadLogFile", ("/etc/hostname",)), ("ReadLogFile", ("/nosuch",)), ("ReadSerno", ()),
-    ("ReadBootblockParam", ("SERNO",)), ("AddBootblockParam", ("COLOR", "blue")),
-    ("GetNetworkSpeedDuplex", ()), ("StartService", ("lensd",)), ("StopService", ("no/unit",)),
-    ("StartNtp", ()), ("StopLensd", ()), ("AdjTime", (0, 1)), ("SetTimeOfDay", (0, 1)),
-    ("ExecuteEthtool", ("x", "eth0")), ("ExecuteLldpcli", ("nosuch",)), ("RtspreadConfig", ()),
-    ("SetDefaultTarget", ("multi-user",)), ("RemoveUser", ("nosuch",)), ("AddGroup", ("-no",)),
-    ("ModifyUser", ("root", "", "users", [], "", "")), ("Digest", (["set"],)))
-
-
-class Sandglass:
-    """When it is over, and a pause at which nobody calls."""
-
-    def __init__(self, callers: int) -> None:
-        self.is_over = threading.Event()
-        self._barrier = threading.Barrier(callers + 1)
-        self._is_paused = threading.Event()
-
-    def wait_if_paused(self) -> None:
-        """What every caller does between two calls."""
-        if self._is_paused.is_set():
-            self._barrier.wait(PATIENCE)
-            self._barrier.wait(PATIENCE)
-
-    def paused(self, look: Callable[[], Any]) -> Any:
-        """What is seen while nobody calls."""
-        self._is_paused.set()
-        self._barrier.wait(PATIENCE)
-        try:
-            return look()
-        finally:
-            self._is_paused.clear()
-            self._barrier.wait(PATIENCE)
-
-    def give_up(self) -> None:
-        self.is_over.set()
-        self._barrier.abort()
-
-
-class Caller(threading.Thread):
-    """Calls all the time; an answer that is neither a result nor an error of the service's own
-    is what failed."""
-
-    def __init__(self, glass: Sandglass, chance: random.Random) -> None:
-        super().__init__()
-        self.counts: Counter = Counter()
-        self.failed: BaseException | None = None
-        self._glass = glass
-        self.chance = random.Random(chance.random())
-        self.bus = Bus()
-
-    def run(self) -> None:
-        try:
-            while not self._glass.is_over.is_set():
-                self._glass.wait_if_paused()
-                self.step()
-            self.bus.close()
-        except BaseException as error:  # the test tells
-            self.failed = error
-            self._glass.give_up()
-
-    def step(self) -> None:
-        member, arguments = self.chance.choice(QUESTIONS)
-        if self.chance.randrange(CALLS_TO_A_TOOL) == 0:
-            member, arguments = self.chance.choice(TOOLS)
-        if self.chance.randrange(CALLS_TO_A_DISCONNECT) == 0:
-            self.drop_off(member, arguments)
-        else:
-            self.call(member, arguments)
-
-    def call(self, member: str, arguments: tuple[Any, ...]) -> Any:
-        self.counts["calls"] += 1
-        try:
-            return self.bus.call(member, SIGNATURES[member], *arguments, timeout=PATIENCE)
-        except BusError as error:
-            assert error.name.startswith("org.gtk.GDBus.UnmappedGError.Quark."), error
-            self.counts["errors"] += 1
-            return error
-
-    def drop_off(self, member: str, arguments: tuple[Any, ...]) -> str:
-        """Leaves without waiting for the answer; the name that it had."""
-        message = Gio.DBusMessage.new_method_call(NAME, PATH, INTERFACE, member)
-        message.set_body(GLib.Variant(f"({SIGNATURES[member]})", arguments))
-        self.bus.connection.send_message(message, Gio.DBusSendMessageFlags.NONE)
-        self.bus.connection.flush_sync(None)
-        left = self.bus.unique_name
-        self.bus.close()
-        self.bus = Bus()
-        self.counts["disconnects"] += 1
-        return left
-
-
-class Changer(Caller):
-    """The one that changes accounts, each change as the model has it. polkit refuses who is gone,
-    if he is by then; so it drops off only where his call counts all the same."""
-
-    def __init__(self, glass: Sandglass, chance: random.Random, modelled: ModelledStage,
-                 may_drop_off: bool) -> None:
-        super().__init__(glass, chance)
-        self._may_drop_off = may_drop_off
-        self._model = modelled.model
-        self._number = 0
-        self._users: list[str] = []
-        self._groups: list[str] = []
-
-    def _new(self, prefix: str) -> str:
-        self._number += 1
-        return f"{prefix}{self._number}"
-
-    def _choose(self) -> tuple[str, tuple[Any, ...]]:
-        chance = self.chance
-        password = self._new(MARK)
-        if not self._users or chance.random() < 0.2 and len(self._users) < ACCOUNTS:
-            name = self._new("u")
-            self._users.append(name)
-            if chance.random() < 0.3:
-                return "AddSystemUser", (name, password, "users", ["viewer"], "/bin/sh", "System")
-            return "AddUser", (name, password, "users", chance.choice(("", "viewer", "admin")),
-                               "Comment")
-        if not self._groups or chance.random() < 0.1 and len(self._groups) < ACCOUNTS:
-            self._groups.append(self._new("g"))
-            return "AddGroup", (self._groups[-1],)
-        if chance.random() < 0.1:
-            return "RemoveGroup", (self._groups.pop(),)
-        name = chance.choice(self._users)
-        if chance.random() < 0.2:
-            self._users.remove(name)
-            return "RemoveUser", (name,)
-        return chance.choice((
-            ("ModifyUser", (name, password, "", ["operator"], "", self._new("Comment "))),
-            ("ModifyUser", (name, "", "", ["nosuch"], "", "")),
-            ("ChpasswdUser", (name, password)),
-            ("ClearUserFields", (name, False, True, True)),
-            ("AddUser", (name, password, "users", "", "")),
-            ("AuthUserBasic", (name, "wrong")),
-            ("GetUser", (name,))))
-
-    def step(self) -> None:
-        member, arguments = self._choose()
-        self.counts["changes"] += 1
-        try:
-            expected: Any = self._model.call(member, *arguments).answer
-        except Refused as error:
-            expected = domain_error(*error.args)
-        if self._may_drop_off and self.chance.randrange(CALLS_TO_A_DISCONNECT) == 0:
-            left = self.drop_off(member, arguments)
-            # What it sent before the bus forgot it, the service has before anything sent later.
-            wait_for("the bus", lambda: self.bus.owner(left) is None, PATIENCE)
-            return
-        answer = self.call(member, arguments)
-        assert answer == expected, (member, arguments, answer, expected)
+# Each must have come about, in both parts; the last one in one of them.
+TRIED = ("calls", "errors", "changes", "disconnects", "tools_run", "tools_failed", "tools_hung")
+TRIED_ONCE = "tools_printed_10_mb"
 
 
 class Housekeeper(threading.Thread):
@@ -219,8 +60,13 @@ class Housekeeper(threading.Thread):
                  authz: FakeAuthz) -> None:
         super().__init__()
         self._glass, self._stage, self._device, self._authz = glass, stage, device, authz
-        self._chance = random.Random(chance.random())
+        self.tools = SoakTools(device, random.Random(chance.random()))
+        self._hang_seconds = 0.0
         self.failed: BaseException | None = None
+
+    def make_hang(self, seconds: float) -> None:
+        """A tool, soon."""
+        self._hang_seconds = seconds
 
     def run(self) -> None:
         try:
@@ -231,15 +77,17 @@ class Housekeeper(threading.Thread):
 
     def _keep(self) -> None:
         while not self._glass.is_over.wait(MANNERS_SECONDS):
-            for member, _ in TOOLS:
-                tool = self._device.tools[RUNNERS[member][0]]
-                tool.before_answering(self._chance.choice(MANNERS))
-                tool.exit_with(self._chance.choice((0, 0, 1, 77)))
-                tool.print(self._chance.choice((b"", b"out\n", b"\xff\xfe", TEN_MEGABYTES)))
+            if self.tools.is_hanging():
+                continue
+            self.tools.note_runs()
+            self.tools.take_up_manners()
             for fake in (*self._device.fakes(), self._stage.pidof, self._authz,
                          self._stage.syslog):
                 fake.forget()
             self._stage.forget_output()
+            if self._hang_seconds > 0:
+                self.tools.hang(self._hang_seconds)
+                self._hang_seconds = 0.0
 
 
 class SoakedStage(Stage):
@@ -258,6 +106,63 @@ class SoakedStage(Stage):
         self._seen += len(new)
         assert MARK.encode() not in new and b"$5$" not in new
         os.truncate(path, 0)
+
+
+class Soak:
+    """All that goes on at the same time."""
+
+    def __init__(self, stage: SoakedStage, modelled: ModelledStage, device: Device,
+                 authz: FakeAuthz, chance: random.Random, is_with_polkit: bool) -> None:
+        self.pid = stage.service.pid
+        self._bus = stage.bus
+        self._glass = Sandglass(CONNECTIONS)
+        self.callers = [Changer(self._glass, chance, modelled, not is_with_polkit),
+                        *(Caller(self._glass, chance) for _ in range(CONNECTIONS - 1))]
+        self._keeper = Housekeeper(self._glass, chance, stage, device, authz)
+        self.counts: Counter[str] = Counter()
+
+    def run(self, seconds: float) -> list[dict[str, int]]:
+        """What was seen after each part of the time, first after a fifth of it."""
+        threads = (*self.callers, self._keeper)
+        looks: list[dict[str, int]] = []
+        for thread in threads:
+            thread.start()
+        try:
+            self._look(seconds, looks)
+        except threading.BrokenBarrierError:
+            pass  # because of what failed
+        finally:
+            self._glass.give_up()
+            for thread in threads:
+                thread.join(PATIENCE)
+        failed = [thread.failed for thread in threads
+                  if thread.failed and not isinstance(thread.failed, threading.BrokenBarrierError)]
+        assert not failed, failed[0]
+        assert looks and not any(thread.is_alive() for thread in threads)
+        assert not self._keeper.tools.is_hanging()
+        return looks
+
+    def _look(self, seconds: float, looks: list[dict[str, int]]) -> None:
+        is_long = seconds > LONG_SECONDS
+        self._glass.is_over.wait(seconds / 5)
+        looks.append(self._glass.paused(lambda: held(self._bus, self.pid)))
+        for number in range(LOOKS):
+            if number == 0 or is_long and number % LOOKS_BETWEEN_HANGS == 0:
+                self._keeper.make_hang(LONG_HANG_SECONDS if is_long else HANG_SECONDS)
+            self._glass.is_over.wait(seconds * 4 / 5 / LOOKS)
+            looks.append(self._glass.paused(lambda: held(self._bus, self.pid)))
+
+    @property
+    def longest_wait(self) -> float:
+        return max(caller.longest_wait for caller in self.callers)
+
+    def add_to(self, figures: Counter[str]) -> None:
+        for source in (*self.callers, self._keeper.tools):
+            self.counts.update(source.counts)
+        longest = {name: self.counts[name] for name in self.counts if name.startswith("max_")}
+        figures.update(self.counts - Counter(longest))
+        for name, value in longest.items():
+            figures[name] = max(figures[name], value)
 
 
 def held(bus: Bus, pid: int) -> dict[str, int]:
@@ -300,43 +205,25 @@ def test_soak(soaked: SoakedStage, request: pytest.FixtureRequest, accounts: Acc
     device.tools[LLDPCLI].print(TEN_MEGABYTES)
     for _ in range(3):
         bus.call("ExecuteLldpcli", "s", "show-neighbors", timeout=PATIENCE)
-    pid = soaked.service.pid
+    soak = Soak(soaked, modelled, device, authz, chance, is_with_polkit)
     begin = time.monotonic()
-    glass = Sandglass(CONNECTIONS)
-    callers = [Changer(glass, chance, modelled, not is_with_polkit),
-               *(Caller(glass, chance) for _ in range(CONNECTIONS - 1))]
-    keeper = Housekeeper(glass, chance, soaked, device, authz)
-    for thread in (*callers, keeper):
-        thread.start()
-    warm: dict[str, int] = {}
-    end: dict[str, int] = {}
-    try:
-        glass.is_over.wait(seconds / 5)
-        warm = glass.paused(lambda: held(bus, pid))
-        glass.is_over.wait(seconds * 4 / 5)
-        end = glass.paused(lambda: held(bus, pid))
-    except threading.BrokenBarrierError:
-        pass  # because of what failed
-    finally:
-        glass.give_up()
-        for thread in (*callers, keeper):
-            thread.join(PATIENCE)
-    for caller in callers:
-        figures.update(caller.counts)
-    failed = [thread.failed for thread in (*callers, keeper)
-              if thread.failed and not isinstance(thread.failed, threading.BrokenBarrierError)]
-    assert not failed, failed[0]
-    assert warm and end and not any(thread.is_alive() for thread in (*callers, keeper))
-
-    growth = end["kib"] - warm["kib"]
+    looks = soak.run(seconds)
     figures["seconds"] += int(time.monotonic() - begin)
+    soak.add_to(figures)
+    growth = max(look["kib"] for look in looks) - looks[0]["kib"]
     figures["max_growth_kib"] = max(figures["max_growth_kib"], growth)
-    name = "polkit" if is_with_polkit else "allowed"
-    print(f"\n{name}: {dict(figures)}\n{warm}\n{end}", flush=True)
-    assert soaked.service.is_running() and soaked.service.pid == pid
-    assert growth < GROWTH_KIB, (warm, end)
-    assert {**end, "kib": 0, "heap": 0} == {**warm, "kib": 0, "heap": 0}
-    assert end["children"] == 0
+    figures["looks"] += len(looks)
+    print(f"\n{request.node.name}: {dict(figures)}\n{looks[0]}\n{looks[-1]}", flush=True)
+    assert soaked.service.is_running() and soaked.service.pid == soak.pid
+    assert len(looks) == LOOKS + 1
+    assert growth < GROWTH_KIB, looks
+    assert {look["descriptors"] for look in looks} == {looks[0]["descriptors"]}, looks
+    assert not any(look["children"] for look in looks), looks
     modelled.check()
-    assert min(caller.counts["calls"] for caller in callers) > 0
-    assert figures["changes"] and figures["disconnects"] and figures["errors"]
+    assert min(caller.counts["calls"] for caller in soak.callers) > 0
+    assert not (missing := [name for name in TRIED if not soak.counts[name]]), missing
+    assert soak.longest_wait > soak.counts["max_hang_seconds"] - 1
+
+
+def test_large_answers_were_tried(figures: Counter) -> None:
+    assert figures[TRIED_ONCE] > 0

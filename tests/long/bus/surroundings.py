@@ -6,12 +6,11 @@ from harness.world import Neighbour, World, snapshot
 
 
 def world(*neighbours: Neighbour) -> World:
-    """Without the count of processes: polkitd and the proofs start some. In "/" only names count,
-    and "/tmp" does not: there this machine's own folders may be seen, and others work in them."""
+    """Without the count of processes: polkitd and the proofs start some. In "/" and "/tmp" only
+    names count: there the machine's own folders may be seen, in which others work."""
     seen = snapshot(*neighbours)
-    folders = {path: entries for path, entries in seen.folders.items() if path != "/tmp"}
-    folders["/"] = {name: (0, 0, 0) for name in folders["/"]}
-    return replace(seen, last_pid=0, folders=folders)
+    names = {path: dict.fromkeys(seen.folders[path], (0, 0, 0)) for path in ("/", "/tmp")}
+    return replace(seen, last_pid=0, folders=seen.folders | names)
 
 
 def differences(before: World, after: World) -> list[Any]:
