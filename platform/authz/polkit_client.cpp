@@ -136,12 +136,11 @@ static void send_probe(pending_check *pending) {
     auto *sent = g_new(probe, 1);
     *sent = {pending, pending->questions};
     pending->unanswered++;
-    g_dbus_connection_call(client_bus, POLKIT_NAME, AUTHORITY_PATH,
-                           "org.freedesktop.DBus.Properties", "Get",
-                           g_variant_new("(ss)", AUTHORITY_INTERFACE, PROBED_PROPERTY),
-                           G_VARIANT_TYPE("(v)"), G_DBUS_CALL_FLAGS_NONE,
-                           remaining_ms(pending->asked->deadline), pending->cancellable,
-                           on_probe_answer, sent);
+    g_dbus_connection_call(
+        client_bus, POLKIT_NAME, AUTHORITY_PATH, "org.freedesktop.DBus.Properties", "Get",
+        g_variant_new("(ss)", AUTHORITY_INTERFACE, PROBED_PROPERTY), G_VARIANT_TYPE("(v)"),
+        G_DBUS_CALL_FLAGS_NONE, remaining_ms(pending->asked->deadline), pending->cancellable,
+        on_probe_answer, sent);
 }
 
 static gboolean on_silence(void *data);
