@@ -22,12 +22,16 @@ static constexpr const char *STANDARD_INTERFACES = "org.freedesktop.DBus.";
 // names that the bus allows are 255 bytes, and there are four of them.
 static constexpr gsize HEADER_ROOM = 2048;
 
+// The bus drops zeros for which its queue for this process has no room.
+static constexpr gint64 LOST_AFTER_US = G_USEC_PER_SEC;
+
 // A short text of a list takes up to four times as much in a message as in its value.
 static constexpr gsize WIRE_FACTOR = 4;
 
 struct read_buffer {
     GDBusInterfaceInfo *interface;  // a reference
     gsize under_way;                // zeros that were sent and have not come back
+    gint64 sent_at;                 // when they were, on the monotonic clock
     gsize wanted;                   // by calls that came meanwhile
 };
 
@@ -62,10 +66,19 @@ static void send_zeros(read_buffer *self, GDBusConnection *connection) {
         message, g_variant_new("(@ay)", g_variant_new_fixed_array(G_VARIANT_TYPE_BYTE, zeros, count,
                                                                   sizeof *zeros)));
     self->under_way = count;
+    self->sent_at = g_get_monotonic_time();
     self->wanted = 0;
     // It fails only when the connection is closed, and the service with it.
     (void)g_dbus_connection_send_message(connection, message, G_DBUS_SEND_MESSAGE_FLAGS_NONE,
                                          nullptr, nullptr);
+}
+
+// They are sent again with the next message of anybody.
+static void want_lost_zeros(read_buffer *self) {
+    if (self->under_way == 0 || g_get_monotonic_time() - self->sent_at < LOST_AFTER_US)
+        return;
+    self->wanted = std::max(self->wanted, self->under_way);
+    self->under_way = 0;
 }
 
 // Only the bus says who sent a message.
@@ -88,6 +101,8 @@ static GDBusMessage *on_message(GDBusConnection *connection, GDBusMessage *messa
     const bool has_returned = are_own_zeros(connection, message);
     if (has_returned)
         self->under_way = 0;
+    else
+        want_lost_zeros(self);
     if (self->wanted > 0 && self->under_way == 0)
         send_zeros(self, connection);
     if (!has_returned)

@@ -5,7 +5,7 @@
 // it is served or refused, the service therefore sends a message of zeros to itself, which goes
 // through the same buffer. A call that names no method may have been meant for one with a password,
 // and is treated alike. Of the zeros there is one message at a time, so that nobody can fill the
-// bus's queue with them.
+// bus's queue with them; those that the bus drops, since others filled it, are sent again.
 #pragma once
 
 #include <gio/gio.h>

@@ -1,0 +1,106 @@
+// tests/unit/service/read_buffer_test.cpp: zeros that the bus drops.
+//
+// The other end of the connection is the test, which gives none back unless it wants to.
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+
+#include <gio/gio.h>
+
+#include "service/read_buffer.h"
+
+static constexpr const char *INTERFACE_XML =
+    "<node><interface name='test.Interface'><method name='Take'/></interface></node>";
+
+static GDBusConnection *connect_end(int fd) {
+    g_autoptr(GSocket) socket = g_socket_new_from_fd(fd, nullptr);
+    g_autoptr(GSocketConnection) stream = g_socket_connection_factory_create_connection(socket);
+    return g_dbus_connection_new_sync(G_IO_STREAM(stream), nullptr, G_DBUS_CONNECTION_FLAGS_NONE,
+                                      nullptr, nullptr, nullptr);
+}
+
+class ReadBuffer : public ::testing::Test {
+  protected:
+    void SetUp() override {
+        int ends[2] = {-1, -1};
+        ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
+        server_ = connect_end(ends[0]);
+        client_ = connect_end(ends[1]);
+        ASSERT_TRUE(server_ != nullptr && client_ != nullptr);
+        info_ = g_dbus_node_info_new_for_xml(INTERFACE_XML, nullptr);
+        read_buffer_guard(server_, info_->interfaces[0]);
+        g_dbus_connection_add_filter(client_, count_zeros, this, nullptr);
+    }
+
+    void TearDown() override {
+        (void)g_dbus_connection_close_sync(client_, nullptr, nullptr);
+        (void)g_dbus_connection_close_sync(server_, nullptr, nullptr);
+        g_object_unref(client_);
+        g_object_unref(server_);
+        g_dbus_node_info_unref(info_);
+    }
+
+    // Returns when it has been answered, and what came before the answer has been counted.
+    void call(const char *interface, const char *member) {
+        g_autoptr(GDBusMessage) call =
+            g_dbus_message_new_method_call(nullptr, "/", interface, member);
+        g_autoptr(GDBusMessage) answer = g_dbus_connection_send_message_with_reply_sync(
+            client_, call, G_DBUS_SEND_MESSAGE_FLAGS_NONE, -1, nullptr, nullptr, nullptr);
+        ASSERT_NE(answer, nullptr);
+    }
+
+    void call_with_secret() { call("com.zintor.PrivaneSystem", "AddUser"); }
+    void ping() { call("org.freedesktop.DBus.Peer", "Ping"); }
+    int zeros() const { return g_atomic_int_get(&zeros_); }
+
+    gint gives_back_ = 0;
+
+  private:
+    // Runs in GDBus's thread.
+    static GDBusMessage *count_zeros(GDBusConnection *connection, GDBusMessage *message,
+                                     gboolean incoming, gpointer data) {
+        auto *self = static_cast<ReadBuffer *>(data);
+        if (incoming == FALSE || g_strcmp0(g_dbus_message_get_member(message), "Zeros") != 0)
+            return message;
+        g_atomic_int_inc(&self->zeros_);
+        if (g_atomic_int_get(&self->gives_back_) != 0) {
+            g_autoptr(GDBusMessage) copy = g_dbus_message_copy(message, nullptr);
+            (void)g_dbus_connection_send_message(connection, copy, G_DBUS_SEND_MESSAGE_FLAGS_NONE,
+                                                 nullptr, nullptr);
+        }
+        return message;
+    }
+
+    GDBusConnection *server_ = nullptr;
+    GDBusConnection *client_ = nullptr;
+    GDBusNodeInfo *info_ = nullptr;
+    gint zeros_ = 0;
+};
+
+TEST_F(ReadBuffer, OneMessageOfZerosIsUnderWayAtATime) {
+    for (int i = 0; i < 5; i++)
+        call_with_secret();
+
+    EXPECT_EQ(zeros(), 1);
+}
+
+TEST_F(ReadBuffer, ZerosThatCameBackAreFollowedByThoseOfTheNextCall) {
+    g_atomic_int_set(&gives_back_, 1);
+    call_with_secret();
+    ping();
+    ASSERT_EQ(zeros(), 1);
+
+    call_with_secret();
+    ping();
+    EXPECT_EQ(zeros(), 2);
+}
+
+// Whoever fills the queue must not keep passwords in the buffer for good.
+TEST_F(ReadBuffer, LostZerosAreSentAgainWithTheNextMessage) {
+    call_with_secret();
+    ASSERT_EQ(zeros(), 1);
+
+    g_usleep(1100 * 1000);
+    ping();
+    ping();
+    EXPECT_EQ(zeros(), 2);
+}
