@@ -3,9 +3,8 @@
 
 #include <cstring>
 
-// dbus-daemon's default max_message_size for the system bus, dbus-daemon(1), and room for the
-// header.
-static constexpr gsize MESSAGE_LIMIT = gsize{32} * 1024 * 1024;
+// The build option; by default dbus-daemon's max_message_size for the system bus, dbus-daemon(1).
+static constexpr gsize MESSAGE_LIMIT = BUS_MESSAGE_LIMIT;
 static constexpr gsize HEADER_ROOM = gsize{64} * 1024;
 
 // The D-Bus wire format: a length, a terminator, and padding to the next length's boundary.

@@ -1,11 +1,12 @@
 #!/bin/bash
 # tests/bus/sandbox.sh: runs a command as root beside a private system bus and the real polkitd.
 #
-#   sandbox.sh [-l DIR]... [-r DIR]... [-w DIR]... [--] COMMAND [ARGUMENT...]
+#   sandbox.sh [-l DIR]... [-r DIR]... [-w DIR]... [-b FILE]... [--] COMMAND [ARGUMENT...]
 #
 #   -l DIR  lay DIR over the sandbox's root before anything starts: DIR/usr/sbin/..., DIR/etc/...
 #   -r DIR  show DIR as it is, read-only (a source tree)
 #   -w DIR  let writes below DIR through to the real file system (a build directory)
+#   -b FILE let the bus include FILE, of a folder that is shown, after all others
 #
 # COMMAND sees this machine through a copy-on-write view: what it writes to /etc, /usr, /run or /tmp
 # lands in memory and is gone afterwards. It has mount, PID, network, IPC and UTS namespaces of its
@@ -25,11 +26,12 @@ die() { echo "sandbox.sh: $*" >&2; exit 125; }
 
 self=$(realpath -e -- "$0")
 original=("$@")
-layers=() shown=("$(dirname "$self")") through=()
+layers=() shown=("$(dirname "$self")") through=() included=()
 while [ $# -gt 0 ]; do
     case $1 in
         -l) layers+=("$(realpath -e -- "$2")") || exit 125; shift 2 ;;
         -r) shown+=("$(realpath -e -- "$2")") || exit 125; shift 2 ;;
+        -b) included+=("$(realpath -e -- "$2")") || exit 125; shift 2 ;;
         -w) through+=("$(realpath -e -- "$2")") || exit 125; shift 2 ;;
         --) shift; break ;;
         -*) die "unknown option $1" ;;
@@ -149,16 +151,24 @@ enter_root() {
     rmdir /.outside
 
     cd /
+    local file options=()
+    for file in ${included[@]+"${included[@]}"}; do
+        options+=(-b "$file")
+    done
     SANDBOX_STAGE=bus exec setpriv --bounding-set=$DROPPED --inh-caps=$DROPPED -- \
-        "$self" -- "$@"
+        "$self" ${options[@]+"${options[@]}"} -- "$@"
 }
 
 # The stock policy of a system bus, as a foreground program that starts no services.
 write_bus_configuration() {
-    local stock=/usr/share/dbus-1
+    local stock=/usr/share/dbus-1 file includes=''
+    for file in ${included[@]+"${included[@]}"}; do
+        includes+="<include>$file</include>"
+    done
     sed -e '/<fork\/>/d' -e '/<syslog\/>/d' -e '/<pidfile>/d' -e '/<servicehelper>/d' \
         -e '/<standard_system_servicedirs\/>/d' \
-        -e "s|<includedir>system.d<|<includedir>$stock/system.d<|" $stock/system.conf \
+        -e "s|<includedir>system.d<|<includedir>$stock/system.d<|" \
+        -e "s|</busconfig>|$includes</busconfig>|" $stock/system.conf \
         >$STATE/bus.conf
 }
 

@@ -1,7 +1,8 @@
 """tests/bus/harness/flooder.py: sends the service more than it can take, as the user it runs as.
 
-    flooder.py KIND SEED
+    flooder.py KIND SEED LARGEST
 
+LARGEST is the most that the bus takes in a message; it throws out who sends more.
 Prints a line when its connections stand, waits for a line, then floods until its standard input
 ends, and prints as JSON what it did. It writes prebuilt bytes to raw sockets and reads no more than
 it must: whoever means harm does not wait for answers.
@@ -26,9 +27,15 @@ from harness.wire import NO_CAPABILITIES
 CONNECTIONS = 8
 STALLED_CONNECTIONS = 40
 MEBIBYTE = 1 << 20
+# Of a message without its arguments, at most.
+HEAD = 1024
 LARGE = 16 * MEBIBYTE
-# The most that the bus takes in a message.
-LARGEST = 32 * MEBIBYTE
+# Of an empty text in a list: its length, its terminator, and padding.
+TEXT_SIZE = 8
+# Of a byte as a variant in a list: the length and the text of its type, and itself.
+VARIANT = b"\x01y\x00\x07"
+# How the service refuses arguments that are too large, service/intake.cpp.
+TOO_LARGE = b"The arguments of the call are too large"
 # Of a message: where its flags, the length of its body and its number stand.
 FLAGS_OFFSET = 2
 BODY_LENGTH_OFFSET = 4
@@ -59,6 +66,7 @@ class Connection:
         self.serial = 1
         self.socket.setblocking(False)
         self.rest = memoryview(b"")
+        self.answers = b""
 
     def number(self, blob: bytes) -> bytearray:
         """The message with the connection's next number."""
@@ -80,9 +88,12 @@ class Connection:
         return is_new
 
     def drain(self) -> None:
+        """Reads what is there, and counts the calls that the service found too large."""
         try:
-            while self.socket.recv(MEBIBYTE):
-                pass
+            while got := self.socket.recv(MEBIBYTE):
+                self.answers += got
+                done["found_too_large"] += self.answers.count(TOO_LARGE)
+                self.answers = self.answers.rpartition(TOO_LARGE)[2][1 - len(TOO_LARGE):]
         except BlockingIOError:
             pass
 
@@ -119,21 +130,21 @@ def list_call(elements: int) -> bytes:
     return call("Pinsrv", GLib.Variant("(as)", ([""] * elements,)))
 
 
-def addressed(message: Gio.DBusMessage) -> bytes:
+def addressed(message: Gio.DBusMessage, size: int) -> bytes:
     message.set_destination(NAME)
-    return blob_of(message, GLib.Variant("(s)", ("x" * LARGE,)))
+    return blob_of(message, GLib.Variant("(s)", ("x" * size,)))
 
 
-def large_signal() -> bytes:
-    return addressed(Gio.DBusMessage.new_signal(PATH, INTERFACE, "UserDatabaseUpdated"))
+def large_signal(size: int) -> bytes:
+    return addressed(Gio.DBusMessage.new_signal(PATH, INTERFACE, "UserDatabaseUpdated"), size)
 
 
-def large_answer() -> bytes:
+def large_answer(size: int) -> bytes:
     """A reply to nothing."""
     message = Gio.DBusMessage()
     message.set_message_type(Gio.DBusMessageType.METHOD_RETURN)
     message.set_reply_serial(7)
-    return addressed(message)
+    return addressed(message, size)
 
 
 def flood_with(blobs: list[bytes], chance: random.Random, is_reading: bool = False) -> None:
@@ -162,15 +173,15 @@ def start() -> None:
     sys.stdin.readline()
 
 
-def calls(chance: random.Random) -> None:
+def calls(chance: random.Random, _: int) -> None:
     flood_with([text_call(8), silent(text_call(8))], chance)
 
 
-def read_calls(chance: random.Random) -> None:
+def read_calls(chance: random.Random, _: int) -> None:
     flood_with([text_call(8)], chance, is_reading=True)
 
 
-def questions(chance: random.Random) -> None:
+def questions(chance: random.Random, _: int) -> None:
     """What is answered without the main loop, at length, to somebody who does not listen."""
     blobs = [call("Ping", None, interface="org.freedesktop.DBus.Peer"),
              call("Introspect", None, interface="org.freedesktop.DBus.Introspectable"),
@@ -180,37 +191,54 @@ def questions(chance: random.Random) -> None:
     flood_with([*blobs, *map(silent, blobs)], chance)
 
 
-def large_calls(chance: random.Random) -> None:
-    flood_with([text_call(LARGE), silent(text_call(LARGE))], chance)
+def large(largest: int) -> int:
+    """The size of a large text, in a message that the bus takes."""
+    return min(LARGE, largest - HEAD)
 
 
-def large_others(chance: random.Random) -> None:
-    flood_with([large_signal(), large_answer()], chance)
+def large_calls(chance: random.Random, largest: int) -> None:
+    blob = text_call(large(largest))
+    flood_with([blob, silent(blob)], chance)
 
 
-def lists(chance: random.Random) -> None:
+def large_others(chance: random.Random, largest: int) -> None:
+    flood_with([large_signal(large(largest)), large_answer(large(largest))], chance)
+
+
+def lists(chance: random.Random, largest: int) -> None:
     """Lists that just fit, and larger ones."""
-    flood_with([silent(list_call(size)) for size in (30_000, 30_000, 30_000, 250_000)], chance)
+    larger = min(250_000, large(largest) // TEXT_SIZE)
+    flood_with([silent(list_call(size)) for size in (30_000, 30_000, 30_000, larger)], chance)
 
 
-def one_list(chance: random.Random) -> None:
-    """A single message, of the elements that cost the receiver most, as large as the bus takes."""
-    # An empty text: a length, a terminator, and padding, which the last one goes without.
-    elements = bytes((LARGEST - 1024) // 8 * 8 - 3)
-    head = bytearray(silent(list_call(0)))
+def largest_list(kind: str, elements: bytes) -> bytes:
+    """A call with one list of that kind of elements, as large as the bus takes."""
+    head = bytearray(call("Pinsrv", GLib.Variant(f"({kind})", ([],))))
     body = struct.pack("<I", len(elements)) + elements
     struct.pack_into("<I", head, BODY_LENGTH_OFFSET, len(body))
-    blob = bytes(head[:-4]) + body
-    connection = Connection()
-    start()
-    connection.push(blob)
-    done["messages"] += 1
-    while not finished(0.01):
-        if connection.rest:
-            connection.push(b"")
+    # Without the length of the empty list.
+    return bytes(head[:-4]) + body
 
 
-def descriptors(chance: random.Random) -> None:
+def flood_with_largest_lists(blob: bytes, chance: random.Random) -> None:
+    # The service answers few of those that it refuses; enough to see that they arrive.
+    flood_with([blob, blob, blob, silent(blob)], chance, is_reading=True)
+
+
+def text_lists(chance: random.Random, largest: int) -> None:
+    """Lists of the shortest texts, as long as a message can be."""
+    # Without the padding of the last one.
+    elements = bytes((largest - HEAD) // TEXT_SIZE * TEXT_SIZE - 3)
+    flood_with_largest_lists(largest_list("as", elements), chance)
+
+
+def variant_lists(chance: random.Random, largest: int) -> None:
+    """Lists of the elements that cost the receiver most, as long as a message can be."""
+    elements = VARIANT * ((largest - HEAD) // len(VARIANT))
+    flood_with_largest_lists(largest_list("av", elements), chance)
+
+
+def descriptors(chance: random.Random, _: int) -> None:
     """Calls that carry open files."""
     handles = [os.open("/dev/null", os.O_RDONLY)] * DESCRIPTORS
     message = Gio.DBusMessage.new_method_call(NAME, PATH, INTERFACE, "GetUser")
@@ -232,11 +260,11 @@ def descriptors(chance: random.Random) -> None:
                 done["blocked"] += 1
 
 
-def stalled(_: random.Random) -> None:
+def stalled(_: random.Random, largest: int) -> None:
     """Messages that begin and never end, while their connections stay."""
     connections = [Connection() for _ in range(STALLED_CONNECTIONS)]
     start()
-    blob = text_call(LARGE)[:-1]
+    blob = text_call(large(largest))[:-1]
     for connection in connections:
         connection.push(blob)
         done["messages"] += 1
@@ -246,7 +274,7 @@ def stalled(_: random.Random) -> None:
                 connection.push(b"")
 
 
-def storm(chance: random.Random) -> None:
+def storm(chance: random.Random, _: int) -> None:
     """Connections that come, call once, and go."""
     blob = text_call(8)
     start()
@@ -263,14 +291,14 @@ def storm(chance: random.Random) -> None:
         done["messages"] += 1
 
 
-KINDS: dict[str, Callable[[random.Random], None]] = {
+KINDS: dict[str, Callable[[random.Random, int], None]] = {
     kind.__name__: kind for kind in (calls, read_calls, questions, large_calls, large_others, lists,
-                                     one_list, descriptors, stalled, storm)}
+                                     text_lists, variant_lists, descriptors, stalled, storm)}
 
 
 def main() -> None:
     try:
-        KINDS[sys.argv[1]](random.Random(sys.argv[2]))
+        KINDS[sys.argv[1]](random.Random(sys.argv[2]), int(sys.argv[3]))
     except (ConnectionError, BrokenPipeError):
         # The bus threw us out.
         done["thrown_out"] += 1

@@ -178,6 +178,19 @@ class ExampleRules(unittest.TestCase):
                          ["g privane-viewer -", "g privane-operator -", "g privane-units -"])
 
 
+class BusLimits(unittest.TestCase):
+    def test_example_lowers_limits_and_does_nothing_else(self):
+        # dbus-daemon(1), those of the system bus.
+        defaults = {"max_message_size": 32 << 20, "max_outgoing_bytes": 127 << 20,
+                    "max_incoming_bytes": 127 << 20}
+        root = ET.parse(DATA / "examples" / "privane-bus-limits.conf").getroot()
+        self.assertEqual(root.tag, "busconfig")
+        self.assertEqual([limit.tag for limit in root], ["limit"] * len(defaults))
+        self.assertEqual({limit.get("name") for limit in root}, set(defaults))
+        for limit in root:
+            self.assertLess(int(limit.text), defaults[limit.get("name")])
+
+
 class BusFiles(unittest.TestCase):
     def rules_of(self, **context):
         root = ET.parse(DATA / f"{NAME}.conf").getroot()
