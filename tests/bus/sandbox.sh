@@ -206,6 +206,15 @@ start_polkitd() {
         { cat $STATE/polkitd.log >&2; die "no polkitd"; }
 }
 
+# tell_of_ended NAME: how a daemon ended that should have been there to the end.
+tell_of_ended() {
+    local pid status=0
+    pid=$(<"$STATE/$1.pid")
+    [ ! -e "/proc/$pid" ] || return 0
+    wait "$pid" 2>/dev/null || status=$?
+    echo "sandbox.sh: $1 ended before the tests did, with status $status" >&2
+}
+
 case ${SANDBOX_STAGE:-outside} in
     outside) enter_namespaces ;;
     root) enter_root "$@" ;;
@@ -219,6 +228,8 @@ case ${SANDBOX_STAGE:-outside} in
         unset SANDBOX_STAGE SANDBOX_SCRATCH SANDBOX_OUTSIDE
         status=0
         "$@" || status=$?
+        tell_of_ended dbus-daemon
+        tell_of_ended polkitd
         exit $status
         ;;
 esac
