@@ -5,7 +5,8 @@
 // the service without any action, and keep those with one waiting for minutes. The numbers below
 // bound memory and the time for which anybody waits: with polkit's answer, a call that is refused
 // for want of an action takes up to 5 ms, so all that may wait together is done within a second.
-// That holds for a polkit that answers at once; one that hangs holds up each call for the deadline.
+// That holds for a polkit that answers at once and a bus that drops no answer; a polkit that hangs
+// holds up each call for the deadline, and an answer that is lost for a second or so.
 //
 // A message reaches the filter when GDBus has built it, one at a time: what a single message costs
 // until then, at most the bus's limit for one, is not bounded here.
@@ -22,7 +23,8 @@ inline constexpr gsize INTAKE_ELEMENT_COST = 128;
 inline constexpr gsize INTAKE_CALL_COST = gsize{4} * 1024 * 1024;
 
 // Calls that have a place. Beyond the shared ones a place is only for who has none, so that one who
-// sends many at once leaves places for 128 others.
+// sends many at once leaves places for 128 others. Senders are connections: of these a user may
+// have 256 by the bus's default.
 inline constexpr guint INTAKE_CALLS = 192;
 inline constexpr guint INTAKE_SHARED_CALLS = 64;
 inline constexpr guint INTAKE_SENDER_CALLS = 16;

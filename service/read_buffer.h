@@ -10,8 +10,10 @@
 
 #include <gio/gio.h>
 
-// What is overwritten, at most. Longer are only lists of the digest file, whose end stays.
-inline constexpr gsize READ_BUFFER_OVERWRITTEN = gsize{64} * 1024;
+#include "service/intake.h"
+
+// What is overwritten of a message's arguments, at most: those of the largest call that is served.
+inline constexpr gsize READ_BUFFER_OVERWRITTEN = INTAKE_CALL_COST;
 
 // For as long as the connection lives. To be called before intake_guard, whose filter lets through
 // neither refused calls nor the zeros. The interface is the one that is exported.

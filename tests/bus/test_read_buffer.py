@@ -63,7 +63,7 @@ def zeros_behind(monitor: Monitor, bus: Bus, member: str, signature: str,
     answered = (bus.unique_name, send(later))
     seen = monitor.until(lambda message: answered == (message.get_destination(),
                                                       message.get_reply_serial()))
-    contents = [message.get_body().unpack()[0] for message in seen
+    contents = [message.get_body().unpack()[1] for message in seen
                 if message.get_member() == "Zeros"]
     assert not any(map(any, contents))
     return list(map(len, contents))
@@ -93,6 +93,20 @@ def test_zeros_follow_a_call_that_names_no_method(
     (zeros,) = zeros_behind(monitor, bus, member, "ss", ("alice", "secret"), path, interface)
 
     assert zeros > len(path) + len("alice" + "secret")
+
+
+@pytest.mark.parametrize("arguments", [
+    ("ss", ("n" * 100_000, "secret")), ("ss", ("n" * 3_000_000, "secret")),
+    ("as", (["set", *["x"] * 20_000, "secret"],)), ("av", ([GLib.Variant("s", "secret")] * 500,))])
+def test_zeros_are_as_long_as_the_call(arguments: tuple[str, tuple], service: Service, bus: Bus,
+                                       monitor: Monitor) -> None:
+    call = Gio.DBusMessage.new_method_call(NAME, PATH, INTERFACE, "Digest")
+    call.set_body(GLib.Variant(f"({arguments[0]})", arguments[1]))
+    call.set_serial(1)
+
+    (zeros,) = zeros_behind(monitor, bus, "Digest", *arguments)
+
+    assert zeros >= len(call.to_blob(Gio.DBusCapabilityFlags.NONE))
 
 
 def test_no_zeros_follow_a_ping(service: Service, bus: Bus, monitor: Monitor) -> None:

@@ -94,7 +94,7 @@ class RefusedSecrets(SecretSearch):
         self.look(f"for a descriptor: {member}", secret)
 
     def for_its_size(self, member: str) -> None:
-        """The password is at the beginning, as it is in a call that anybody has a use for."""
+        """The password is at the beginning: what a call holds beyond the largest size stays."""
         secret = self.draw()
         call = Call("for its size", member, SIGNATURES[member] + "s",
                     (*arguments_of(secret)[member], "x" * CALL_COST))
