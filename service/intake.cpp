@@ -63,6 +63,11 @@ static gboolean place_equal(const void *left, const void *right) {
     return one->serial == other->serial && g_str_equal(one->sender, other->sender);
 }
 
+// To look a place up with, as long as the name is there.
+static place place_key(const char *sender, guint32 serial) {
+    return {const_cast<char *>(sender), serial, 0};
+}
+
 static void intake_clear(void *data) {
     auto *self = static_cast<intake *>(data);
     GHashTableIter iterator;
@@ -206,7 +211,7 @@ static bool is_served(const intake *self, GDBusMessage *call) {
 enum class verdict { TAKEN, NO_ROOM, UNANSWERABLE };
 
 static verdict take(intake *self, GDBusMessage *call, const char *sender, gsize cost) {
-    const place key = {const_cast<char *>(sender), g_dbus_message_get_serial(call), 0};
+    const place key = place_key(sender, g_dbus_message_get_serial(call));
 
     g_mutex_lock(&self->lock);
     // With the number of a call that is not answered yet, the two answers could not be told apart.
@@ -310,8 +315,8 @@ static void note_answer(intake *self, GDBusMessage *message) {
     const GDBusMessageType type = g_dbus_message_get_message_type(message);
     if (type != G_DBUS_MESSAGE_TYPE_METHOD_RETURN && type != G_DBUS_MESSAGE_TYPE_ERROR)
         return;
-    const place key = {const_cast<char *>(name_of(g_dbus_message_get_destination(message))),
-                       g_dbus_message_get_reply_serial(message), 0};
+    const place key = place_key(name_of(g_dbus_message_get_destination(message)),
+                                g_dbus_message_get_reply_serial(message));
 
     g_mutex_lock(&self->lock);
     void *held = nullptr;

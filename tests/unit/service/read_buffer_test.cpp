@@ -55,9 +55,7 @@ class ReadBuffer : public ::testing::Test {
 
     // Of the zeros that come, the first are given back when the test says so, the others never.
     void keep_first() { g_atomic_int_set(&keeps_first_, 1); }
-    void give_back_first() {
-        give_back(client_, g_atomic_pointer_get(&first_));
-    }
+    void give_back_first() { give_back(client_, g_atomic_pointer_get(&first_)); }
 
     gint gives_back_ = 0;
 
