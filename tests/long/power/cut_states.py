@@ -48,25 +48,29 @@ def epochs(entries: Sequence[Entry], start: int) -> list[list[int]]:
 
 
 def subsets(entries: Sequence[Entry], start: int, amount: int, seed: str) -> list[State]:
-    """Different ones, spread over the epochs; fewer than asked for where there are no more."""
+    """Different ones: one of every epoch that has any, also where these are more than the amount,
+    and then in turn of all epochs; fewer than asked for where there are no more."""
     chance = random.Random(seed)
     drawn: dict[State, None] = {}
-    all_epochs = epochs(entries, start)
-    vain = dict.fromkeys(range(len(all_epochs)), 0)
-    while vain and len(drawn) < amount:
-        for number in list(vain):
-            state = _draw(entries, all_epochs[number], chance)
-            if state is None or state in drawn:
-                # A small epoch's states are soon all drawn.
-                vain[number] += 1
-                if vain[number] == IN_VAIN:
-                    del vain[number]
-                continue
-            drawn[state] = None
-            vain[number] = 0
-            if len(drawn) == amount:
-                break
+    left = [epoch for epoch in epochs(entries, start)
+            if _draw_new(entries, epoch, chance, drawn)]
+    while left and len(drawn) < amount:
+        chance.shuffle(left)
+        # A small epoch's states are soon all drawn.
+        left = [epoch for epoch in left
+                if len(drawn) >= amount or _draw_new(entries, epoch, chance, drawn)]
     return list(drawn)
+
+
+def _draw_new(entries: Sequence[Entry], epoch: list[int], chance: random.Random,
+              drawn: dict[State, None]) -> bool:
+    """Adds a state that was not drawn yet; False where none was found."""
+    for _ in range(IN_VAIN):
+        state = _draw(entries, epoch, chance)
+        if state is not None and state not in drawn:
+            drawn[state] = None
+            return True
+    return False
 
 
 def _draw(entries: Sequence[Entry], epoch: list[int], chance: random.Random) -> State | None:
@@ -94,7 +98,7 @@ def _unit(entry: Entry) -> int:
 
 def choose(entries: Sequence[Entry], start: int, amount: int, seed: str) -> list[State]:
     """Every prefix, also where they are more than the amount, and subsets for the rest, which is a
-    fifth of the amount at least; ordered by where they begin."""
+    fifth of the amount at least and one of each epoch; ordered by where they begin."""
     chosen = prefixes(entries, start)
     rest = max(amount - len(chosen), amount // LEAST_SUBSETS)
     chosen += subsets(entries, start, rest, seed)

@@ -42,6 +42,11 @@ def test_subsets_stay_within_their_epoch() -> None:
     assert whole == {(2,), (3,), (1, 3), (2, 3), (8,)}
 
 
+def test_every_epoch_that_has_subsets_is_in_the_smallest_choice() -> None:
+    for seed in range(20):
+        assert {state.base for state in subsets(entries(), 0, 0, str(seed))} == {1, 7}
+
+
 def test_only_what_is_not_the_file_systems_own_is_torn_within_a_block() -> None:
     found = [state for state in subsets(entries(), 0, 1000, "seed") if state.bytes]
     assert {state.torn for state in found} == {1, 2, 7, 8}
@@ -60,7 +65,8 @@ def test_the_same_seed_chooses_the_same() -> None:
 def test_no_prefix_is_left_out_of_a_small_amount() -> None:
     every = set(prefixes(entries(), 0))
     assert len(every) == 6
-    for amount, subsets_of_it in ((1, 0), (5, 1), (6, 1), (8, 2), (10, 4)):
+    # The epoch of one write past the cache has no subset.
+    for amount, subsets_of_it in ((1, 2), (5, 2), (6, 2), (8, 2), (10, 4)):
         chosen = choose(entries(), 0, amount, "1")
         assert every <= set(chosen)
         assert len(chosen) == 6 + subsets_of_it
