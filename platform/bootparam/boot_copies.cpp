@@ -6,11 +6,10 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstring>
-#include <ctime>
 #include <string_view>
 
 #include <fcntl.h>
-#include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 #include <zlib.h>
 
@@ -20,12 +19,9 @@ static constexpr std::size_t COPY_HEADER = CRC_SIZE + 1;
 
 // U-Boot's list of flags, of which libubootenv makes a parameter only when it writes.
 static constexpr std::string_view FLAGS = ".flags=";
-// libubootenv may write two letters for a parameter where the list had fewer.
-static constexpr std::size_t FLAG_LETTERS = 2;
 
-static constexpr const char *LOCK = "/var/lock/fw_printenv.lock";
-static constexpr int LOCK_TRIES = 300;
-static constexpr struct timespec LOCK_PAUSE = {0, 10'000'000};
+// What ends the name of a UBI device before the name of a volume.
+static constexpr char NAME_SEPARATOR = ':';
 
 boot_copies::~boot_copies() {
     const int saved_errno = errno;
@@ -47,7 +43,7 @@ bool boot_copies::read_line(const char *line) {
         std::free(device);
         return false;
     }
-    copies_[count_] = {device, static_cast<off_t>(offset), size, -1};
+    copies_[count_] = {device, static_cast<off_t>(offset), size, copy_kind::UNCHECKED, -1};
     count_++;
     return true;
 }
@@ -63,20 +59,55 @@ int boot_copies::read_config(const char *path) {
         (void)read_line(line);  // Comments and what is no copy are passed over.
     std::free(line);
     (void)std::fclose(config);  // It was only read.
-    return count_ > 0 && copies_[0].size > COPY_HEADER ? 0 : -EINVAL;
+    for (int i = 0; i < count_; i++)
+        if (copies_[i].size <= COPY_HEADER)
+            return -EINVAL;
+    return count_ > 0 ? 0 : -EINVAL;
+}
+
+static int open_device(const char *device) {
+    return ::open(device, O_RDONLY | O_NOCTTY | O_CLOEXEC);
+}
+
+int boot_copies::open_copy(copy *one) {
+    const int fd = open_device(one->device);
+    if (fd < 0)
+        // libubootenv has found what it names, or it would not have taken the description.
+        return errno == ENOENT && std::strchr(one->device, NAME_SEPARATOR) != nullptr ? 0 : -errno;
+
+    struct stat status = {};
+    const int result = fstat(fd, &status) == 0 ? find_copy_kind(fd, &status, &one->kind) : -errno;
+    if (result == 0 && one->kind == copy_kind::KEPT_OPEN)
+        one->fd = fd;
+    else
+        (void)close(fd);  // Nothing was written through it.
+    return result;
 }
 
 int boot_copies::open() {
-    for (int i = 0; i < count_; i++) {
-        copies_[i].fd = ::open(copies_[i].device, O_RDONLY | O_NOCTTY | O_CLOEXEC);
-        if (copies_[i].fd < 0)
-            return -errno;
-    }
-    return 0;
+    int result = 0;
+    for (int i = 0; i < count_ && result == 0; i++)
+        result = open_copy(&copies_[i]);
+    return result;
+}
+
+bool boot_copies::has_unchecked() const {
+    for (int i = 0; i < count_; i++)
+        if (copies_[i].kind == copy_kind::UNCHECKED)
+            return true;
+    return false;
 }
 
 std::size_t boot_copies::capacity() const {
-    return copies_[0].size - COPY_HEADER;
+    std::size_t smallest = copies_[0].size;
+    for (int i = 1; i < count_; i++)
+        smallest = std::min(smallest, copies_[i].size);
+    return smallest - COPY_HEADER;
+}
+
+static bool read_at(int fd, off_t offset, char *bytes, std::size_t size) {
+    const off_t start = offset < 0 ? lseek(fd, 0, SEEK_END) + offset : offset;
+    return pread(fd, bytes, size, start) == static_cast<ssize_t>(size);
 }
 
 boot_copies::copy_bytes boot_copies::read_copy(const copy &one) {
@@ -84,8 +115,13 @@ boot_copies::copy_bytes boot_copies::read_copy(const copy &one) {
     if (bytes == nullptr)
         return nullptr;
 
-    const off_t start = one.offset < 0 ? lseek(one.fd, 0, SEEK_END) + one.offset : one.offset;
-    if (pread(one.fd, bytes.get(), one.size, start) == static_cast<ssize_t>(one.size))
+    const int fd = one.fd >= 0 ? one.fd : open_device(one.device);
+    if (fd < 0)
+        return nullptr;
+    const bool is_whole = read_at(fd, one.offset, bytes.get(), one.size);
+    if (fd != one.fd)
+        (void)close(fd);  // Nothing was written through it.
+    if (is_whole)
         return bytes;
     errno = EIO;  // as libubootenv has it, whatever the cause
     return nullptr;
@@ -109,6 +145,8 @@ static bool has_end(std::string_view parameters) {
 int boot_copies::check_ends() const {
     const std::size_t header = count_ == 1 ? CRC_SIZE : COPY_HEADER;
     for (int i = 0; i < count_; i++) {
+        if (copies_[i].kind == copy_kind::UNCHECKED)
+            continue;
         const copy_bytes bytes = read_copy(copies_[i]);
         if (bytes == nullptr)
             return -errno;
@@ -126,7 +164,7 @@ static std::size_t flags_in(std::string_view text) {
          at = text.find(FLAGS, at + 1)) {
         const std::string_view list = text.substr(at, text.find('\0', at) - at);
         const auto commas = static_cast<std::size_t>(std::count(list.begin(), list.end(), ','));
-        longest = std::max(longest, list.size() + 1 + FLAG_LETTERS * (commas + 1));
+        longest = std::max(longest, list.size() + 1 + boot_copies::FLAG_LETTERS * (commas + 1));
     }
     return longest;
 }
@@ -134,6 +172,8 @@ static std::size_t flags_in(std::string_view text) {
 int boot_copies::flags_length(std::size_t *out_length) const {
     std::size_t longest = 0;
     for (int i = 0; i < count_; i++) {
+        if (copies_[i].kind == copy_kind::UNCHECKED)
+            continue;
         const copy_bytes bytes = read_copy(copies_[i]);
         if (bytes == nullptr)
             return -errno;
@@ -145,26 +185,8 @@ int boot_copies::flags_length(std::size_t *out_length) const {
 
 int boot_copies::sync() const {
     for (int i = 0; i < count_; i++)
-        // Flash is written through: its devices know no fsync.
-        if (fsync(copies_[i].fd) != 0 && errno != EINVAL)
+        // Files that are written through, like sysfs's, may know no fsync.
+        if (copies_[i].fd >= 0 && fsync(copies_[i].fd) != 0 && errno != EINVAL)
             return -errno;
     return 0;
-}
-
-int await_boot_lock() {
-    const int fd = open(LOCK, O_RDWR | O_CREAT | O_NOFOLLOW | O_NOCTTY | O_CLOEXEC, 0600);
-    if (fd < 0)
-        return -errno;
-
-    int result = -EBUSY;
-    for (int tries = 0; tries < LOCK_TRIES && result == -EBUSY; tries++) {
-        if (flock(fd, LOCK_EX | LOCK_NB) == 0)
-            result = 0;
-        else if (errno != EWOULDBLOCK && errno != EINTR)
-            result = -errno;
-        else
-            (void)nanosleep(&LOCK_PAUSE, nullptr);  // A shorter pause does no harm.
-    }
-    (void)close(fd);  // which gives the lock back
-    return result;
 }

@@ -1,6 +1,7 @@
 // platform/bootparam/bootparam.cpp: named parameters in the boot block, through libubootenv.
 #include "platform/bootparam/bootparam.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstddef>
 #include <cstdlib>
@@ -11,6 +12,7 @@
 #include <libuboot.h>
 
 #include "platform/bootparam/boot_copies.h"
+#include "platform/bootparam/boot_lock.h"
 
 static constexpr const char *DEFAULT_CONFIG = "/etc/fw_env.config";
 static constexpr int ONLY_UNIT = 0;
@@ -57,12 +59,17 @@ class environment {
 
     // -ENODATA when no copy is valid; the environment is then empty.
     int open() {
-        int result = await_boot_lock();
+        boot_lock lock;
+        int result = lock.take();
         if (result == 0)
             result = copies_.open();
         if (result == 0)
             result = copies_.check_ends();
-        return result == 0 ? libuboot_open(ctx_) : result;
+        lock.give_back();
+        if (result == 0)
+            result = libuboot_open(ctx_);
+        // libubootenv holds the lock now. Somebody may have written before it did.
+        return result == 0 ? copies_.check_ends() : result;
     }
 
     char *get(const char *name) { return libuboot_get_env(ctx_, name); }
@@ -75,6 +82,8 @@ class environment {
         int result = copies_.flags_length(&flags);
         if (result != 0)
             return result;
+        if (copies_.has_unchecked())
+            flags = std::max(flags, longest_flags());
         if (length() + flags + 1 > copies_.capacity())
             return -ENOSPC;
         result = libuboot_env_store(ctx_);
@@ -90,6 +99,15 @@ class environment {
             used +=
                 std::strlen(libuboot_getname(entry)) + std::strlen(libuboot_getvalue(entry)) + 2;
         return used;
+    }
+
+    // A list of flags that names every parameter, each between a separator and its letters.
+    std::size_t longest_flags() const {
+        std::size_t longest = std::strlen(FLAGS) + 1;
+        for (void *entry = libuboot_iterator(ctx_, nullptr); entry != nullptr;
+             entry = libuboot_iterator(ctx_, entry))
+            longest += std::strlen(libuboot_getname(entry)) + 2 + boot_copies::FLAG_LETTERS;
+        return longest;
     }
 
     struct uboot_ctx *ctx_ = nullptr;

@@ -4,6 +4,15 @@
  * /etc/fw_env.config: with two lines there are two copies, each with a CRC, and a write replaces
  * the older one. A power cut during a write leaves the old values.
  *
+ * A copy that is valid, but has no end to its parameters, would be read beyond its end: it is
+ * refused. Two kinds of copies cannot be checked for that, and are left to libubootenv: those on
+ * MTD NAND flash, whose bad blocks it skips, and those on UBI volumes that are given by a name only
+ * it resolves, like /dev/ubi0:NAME (/dev/ubi0_0 is checked). With one of them a write also keeps
+ * room for flags of all parameters (".flags"), so that ENOSPC comes earlier.
+ *
+ * Files and block devices are synced after a write. Of other devices, like flash, a write that
+ * returned counts as done.
+ *
  * Like those tools, each call holds a lock on /var/lock/fw_printenv.lock. It waits for it for about
  * 3 seconds, then fails with EBUSY; without a lock file that can be opened it fails, too.
  *

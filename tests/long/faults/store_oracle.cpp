@@ -94,6 +94,7 @@ static constexpr boot_row boot_rows[] = {
     {boot_file::LOCK,   "close",    0, boot_cause::NONE          }, // it has closed
     {boot_file::COPY,   "stat",     0, boot_cause::NO_DESCRIPTION},
     {boot_file::COPY,   "readlink", 0, boot_cause::NO_DESCRIPTION},
+    {boot_file::COPY,   "fstat",    0, boot_cause::ITS_OWN       },
     {boot_file::COPY,   "open",     1, boot_cause::NO_DESCRIPTION},
     {boot_file::COPY,   "open",     2, boot_cause::NO_DESCRIPTION},
     {boot_file::COPY,   "open",     3, boot_cause::ITS_OWN       },

@@ -15,6 +15,7 @@
 
 #include <glib.h>
 
+#include "platform/bootparam/boot_copies.h"
 #include "tests/unit/platform/boot_block.h"
 #include "tests/unit/platform/outcome.h"
 
@@ -66,6 +67,24 @@ TEST_F(BootParamConfig, DescriptionThatIsNoneIsRefused) {
     for (const std::string &description : descriptions) {
         write_file(CONFIG, description);
         EXPECT_EQ(all_calls(), three_times(failed(EINVAL))) << description.substr(0, 80);
+    }
+}
+
+// Whatever libubootenv lets pass.
+TEST_F(BootParamConfig, EveryCopyHasRoomForAParameter) {
+    for (const char *sizes : {"0x5 0x4000", "0x4000 0x5", "0x4000 0x0", "0x0 0x0", "0x5 0x5"}) {
+        const std::string both = sizes;
+        const std::size_t blank = both.find(' ');
+        write_file(CONFIG, copy(0) + " 0x0 " + both.substr(0, blank) + "\n" + copy(1) + " 0x0" +
+                               both.substr(blank) + "\n");
+        boot_copies copies;
+        EXPECT_EQ(copies.read_config(CONFIG), -EINVAL) << sizes;
+    }
+    for (const char *size : {"0x6", "0x4000"}) {
+        write_file(CONFIG, copy(0) + " 0x0 0x4000\n" + copy(1) + " 0x0 " + size + "\n");
+        boot_copies copies;
+        EXPECT_EQ(copies.read_config(CONFIG), 0) << size;
+        EXPECT_EQ(copies.capacity(), std::stoul(size, nullptr, 16) - 5) << "the smaller one's";
     }
 }
 

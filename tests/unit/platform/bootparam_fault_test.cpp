@@ -7,12 +7,14 @@
 #include <utility>
 #include <vector>
 
+#include <fcntl.h>
 #include <malloc.h>
 #include <sys/file.h>
 #include <sys/mount.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
+#include <zlib.h>
 
 #include "tests/unit/platform/boot_block.h"
 
@@ -24,6 +26,11 @@ struct write_fault {
 };
 static const write_fault *planned;
 static bool unlock_fails;
+// What another process does before libubootenv has the lock, for which it waits.
+static void (*before_lock)();
+// How often a copy was checked, and whether somebody held the lock each time.
+static int checks;
+static bool was_unlocked;
 
 [[noreturn]] static void end_process() {
     (void)kill(getpid(), SIGKILL);
@@ -53,11 +60,26 @@ int fsync(int fd) {
 }
 
 int flock(int fd, int operation) {
+    if (operation == LOCK_EX && before_lock != nullptr)
+        before_lock();
     const int result = static_cast<int>(syscall(SYS_flock, fd, operation));
     if (!unlock_fails || operation != LOCK_UN)
         return result;
     errno = EIO;
     return -1;
+}
+
+static bool is_locked() {
+    const int fd = open("/run/lock/fw_printenv.lock", O_RDWR | O_CLOEXEC);
+    const bool locked = syscall(SYS_flock, fd, LOCK_EX | LOCK_NB) != 0 && errno == EWOULDBLOCK;
+    (void)close(fd);
+    return locked;
+}
+
+uLong crc32(uLong crc, const Bytef *bytes, uInt length) {
+    checks++;
+    was_unlocked = was_unlocked || !is_locked();
+    return crc32_z(crc, bytes, length);
 }
 
 class BootParamFault : public BootParam {
@@ -161,8 +183,8 @@ TEST_F(BootParamFault, FailingSyncIsAFailure) {
     EXPECT_EQ(read("a"), "=" + OLD);
 }
 
-// Flash is written through; its devices answer a sync with EINVAL.
-TEST_F(BootParamFault, DeviceWithoutSyncIsWritten) {
+// Some files that are written through answer a sync with EINVAL.
+TEST_F(BootParamFault, FileWithoutSyncIsWritten) {
     const write_fault fault = {0, EINVAL, true};
     planned = &fault;
     const std::string outcome = BootParam::write("a", NEW);
@@ -177,6 +199,46 @@ TEST_F(BootParamFault, FailingUnlockChangesNothing) {
     const std::string outcome = read("nothing");
     unlock_fails = false;
     EXPECT_EQ(outcome, ABSENT);
+}
+
+// Where there seems to be no end it is the CRC that counts.
+TEST_F(BootParamFault, CopiesAreOnlyReadUnderTheLock) {
+    write_file(copy(0), image(std::string(COPY_SIZE - 5, 'x'), "\x01"));
+    ASSERT_FALSE(is_locked());
+    checks = 0;
+    was_unlocked = false;
+    EXPECT_EQ(read("a"), failed(EBADMSG));
+    EXPECT_EQ(BootParam::write("a", NEW), failed(EBADMSG));
+    EXPECT_EQ(checks, 2);
+    EXPECT_FALSE(was_unlocked);
+}
+
+// Of the older copy, whose parameters libubootenv does not look at.
+TEST_F(BootParamFault, CopiesAreCheckedAgainOnceLibubootenvHasTheLock) {
+    before_lock = [] {
+        const int older = read_file(copy(0))[4] < read_file(copy(1))[4] ? 0 : 1;
+        write_file(copy(older),
+                   image(std::string(COPY_SIZE - 5, 'x'), read_file(copy(older)).substr(4, 1)));
+    };
+    const std::string outcome = read("a");
+    restore();
+    const std::string of_write = BootParam::write("a", NEW);
+    before_lock = nullptr;
+    EXPECT_EQ(outcome, failed(EBADMSG));
+    EXPECT_EQ(of_write, failed(EBADMSG));
+    restore();
+    EXPECT_EQ(read("a"), "=" + OLD);
+}
+
+// So that what another writes before is no reason to refuse, as long as it is whole.
+TEST_F(BootParamFault, WhatAnotherWritesBeforeLibubootenvHasTheLockIsRead) {
+    before_lock = [] {
+        const std::string parameters("a=another's\0\0", 13);
+        write_file(copy(0), image(parameters + std::string(COPY_SIZE - 5 - 13, '\0'), "\x7f"));
+    };
+    const std::string value = read("a");
+    before_lock = nullptr;
+    EXPECT_EQ(value, "=another's");
 }
 
 TEST_F(BootParamFault, ReadOnlyBlockIsReadAndSaysWhyItIsNotWritten) {
