@@ -36,8 +36,10 @@ SHORT_DEADLINE = 0.3
 # How often libauthz looks, at most, within the default deadline.
 MOST_PROBES = 27
 
-# Of an answer that waits for nobody.
-AT_ONCE = 1.0
+# Of an answer that waits for nothing but a busy machine: less than the default deadline.
+PATIENCE = 15.0
+
+POLKIT = "org.freedesktop.PolicyKit1"
 
 SILENCE = domain_error("authz", 4, "Authorization check failed: cannot check action "
                                    f"{ACTION_PREFIX}checkuser: no answer in time")
@@ -56,7 +58,7 @@ def hasty_service(start: StartService, bus: Bus) -> Iterator[Service]:
 @pytest.fixture
 def monitor() -> Iterator[Monitor]:
     """Of what polkit is asked, and of all answers."""
-    listener = Monitor("type='method_call',destination='org.freedesktop.PolicyKit1'",
+    listener = Monitor(f"type='method_call',destination='{POLKIT}'",
                        "type='method_return'", "type='error'")
     yield listener
     listener.close()
@@ -70,6 +72,21 @@ def until_answered(monitor: Monitor, serial: int) -> list[Gio.DBusMessage]:
     """All up to the answer to a call."""
     return monitor.until(lambda message: message.get_reply_serial() == serial
                          and message.get_body().unpack() == (True,))
+
+
+def require_at_once(messages: list[Gio.DBusMessage], count: int) -> None:
+    """Each of the last so many calls was answered as soon as polkit had answered: with nothing said
+    to polkit in between, neither a question nor a look whether it lives."""
+    questions = [at for at, message in enumerate(messages)
+                 if message.get_member() == "CheckAuthorization"]
+    assert len(questions) >= count
+    for at in questions[-count:]:
+        question = (messages[at].get_sender(), messages[at].get_serial())
+        rest = iter(messages[at + 1:])
+        assert any((message.get_destination(), message.get_reply_serial()) == question
+                   for message in rest), "polkit did not answer"
+        after = next(message for message in rest if message.get_sender() == question[0])
+        assert after.get_reply_serial() > 0, after.get_member()
 
 
 def answers(wire: Wire, count: int, seconds: float) -> list[tuple[int, object, float]]:
@@ -97,7 +114,7 @@ def test_slow_polkit_is_waited_for_by_each_of_many_calls(
     wire.close()
     assert [(serial, answer) for serial, answer, _ in seen] == [(serial, (True,))
                                                                 for serial in serials]
-    assert min(taken for *_, taken in seen) > RULE_SECONDS / 2
+    assert sum(taken for *_, taken in seen) >= CALLS * RULE_SECONDS
     assert real_service.output() == before
     # It works on no question twice.
     messages = until_answered(monitor, serials[-1])
@@ -118,14 +135,15 @@ def test_hanging_polkitd_costs_one_call_its_deadline(real_service: Service, bus:
         [(answered, answer, seconds)] = answers(wire, 1, DEADLINE + 10)
 
     assert (answered, answer) == (serial, SILENCE)
-    assert DEADLINE - 1 < seconds < DEADLINE + 5
+    assert DEADLINE - 1 < seconds < DEADLINE + 10
     assert real_service.output() == before + [f"warning: {SILENCE.text}"]
     members = members_until_error(monitor)
     # Before it, one that was answered.
     assert members["CheckAuthorization"] == 1 + 1
     assert 0 < members["Get"] <= MOST_PROBES
     (serial,) = call(wire, 1)
-    assert answers(wire, 1, AT_ONCE)[0][:2] == (serial, (True,))
+    assert answers(wire, 1, PATIENCE)[0][:2] == (serial, (True,))
+    require_at_once(until_answered(monitor, serial), 1)
     wire.close()
 
 
@@ -135,22 +153,21 @@ def members_until_error(monitor: Monitor) -> Counter[str | None]:
     return Counter(message.get_member() for message in seen)
 
 
-def test_calls_in_a_row_each_have_the_deadline(hasty_service: Service, bus: Bus) -> None:
+def test_calls_in_a_row_each_have_the_deadline(hasty_service: Service, bus: Bus,
+                                               monitor: Monitor) -> None:
     assert bus.call("CheckUser", "s", "root") == (True,)
     wire = Wire()
     before = hasty_service.output()
 
     with hanging_polkitd():
         serials = call(wire, CALLS)
-        seen = answers(wire, CALLS, AT_ONCE + SHORT_DEADLINE)
+        seen = answers(wire, CALLS, PATIENCE)
         assert [(serial, answer) for serial, answer, _ in seen] == [(serial, SILENCE)
                                                                     for serial in serials]
-        taken = [seconds for *_, seconds in seen]
-        assert sum(taken) >= CALLS * SHORT_DEADLINE and max(taken) < AT_ONCE, taken
-    begin = time.monotonic()
+        assert sum(seconds for *_, seconds in seen) >= CALLS * SHORT_DEADLINE
     (serial,) = call(wire, 1)
-    assert answers(wire, 1, AT_ONCE)[0][:2] == (serial, (True,))
-    assert time.monotonic() - begin < AT_ONCE
+    assert answers(wire, 1, PATIENCE)[0][:2] == (serial, (True,))
+    require_at_once(until_answered(monitor, serial), 1)
 
     wire.close()
     assert hasty_service.output() == before + [f"warning: {SILENCE.text}"] * CALLS
@@ -165,7 +182,7 @@ def test_call_that_waits_when_polkit_returns_is_answered(real_service: Service, 
         serials = call(wire, CALLS)
         assert wire.is_silent(3.5)
 
-    seen = answers(wire, CALLS, AT_ONCE)
+    seen = answers(wire, CALLS, PATIENCE)
     wire.close()
     assert [(serial, answer) for serial, answer, _ in seen] == [(serial, (True,))
                                                                 for serial in serials]
@@ -173,3 +190,4 @@ def test_call_that_waits_when_polkit_returns_is_answered(real_service: Service, 
     messages = until_answered(monitor, serials[-1])
     questions = [message for message in messages if message.get_member() == "CheckAuthorization"]
     assert len(questions) == 1 + CALLS
+    require_at_once(messages, CALLS)

@@ -1,4 +1,5 @@
-"""tests/bus/harness/fake_authz.py: the test's side of tests/fakes/authz."""
+"""tests/bus/harness/fake_authz.py: the test's side of tests/fakes/authz, and what stands in its
+place where polkit decides."""
 from dataclasses import dataclass
 from pathlib import Path
 
@@ -12,6 +13,20 @@ CODE = 42
 class Check:
     sender: str
     action: str
+
+
+class PolkitDecides:
+    """In the place of the fake: our own library in front of the sandbox's polkit, the installed one
+    or another build of it."""
+
+    def __init__(self, library: Path | None = None) -> None:
+        self._library = library
+
+    def environment(self) -> dict[str, str]:
+        return {"LD_LIBRARY_PATH": str(self._library.parent)} if self._library else {}
+
+    def forget(self) -> None:
+        """It keeps no record."""
 
 
 class FakeAuthz:

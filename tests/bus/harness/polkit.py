@@ -8,6 +8,7 @@ from typing import Any, Iterator, Mapping
 
 from gi.repository import GLib
 
+from harness import process
 from harness.bus import Bus, User
 from harness.deadline import wait_for
 from harness.interface import ACTION_PREFIX
@@ -38,10 +39,17 @@ def actions(bus: Bus) -> dict[str, tuple[int, int, int]]:
     return {row[0]: (row[6], row[7], row[8]) for row in reply[0]}
 
 
+def stop_polkitd() -> None:
+    """From then on it is there, and answers nobody."""
+    os.kill(polkitd_pid(), signal.SIGSTOP)
+    wait_for("polkitd's stop", lambda: process.status(polkitd_pid())["State"].startswith("T"),
+             ANSWER_SECONDS)
+
+
 @contextmanager
 def hanging_polkitd() -> Iterator[None]:
-    """polkitd is there, and answers nobody."""
-    os.kill(polkitd_pid(), signal.SIGSTOP)
+    """polkitd is stopped meanwhile."""
+    stop_polkitd()
     try:
         yield
     finally:

@@ -45,6 +45,7 @@ class Service:
         self._others = process.children()
         OUTPUTS.mkdir(exist_ok=True)
         self._output = tempfile.NamedTemporaryFile(dir=OUTPUTS)
+        self._forgotten = 0
         # A critical of GLib's tells a broken assumption, which ends the service here.
         surroundings = {"PATH": "/usr/sbin:/usr/bin:/sbin:/bin", "G_DEBUG": "fatal-criticals",
                         "DBUS_SYSTEM_BUS_ADDRESS": SYSTEM_BUS, **(environment or {})}
@@ -78,6 +79,16 @@ class Service:
     def output(self) -> list[str]:
         """The lines on standard output and standard error, in their order."""
         return Path(self._output.name).read_text(errors="backslashreplace").splitlines()
+
+    def forget_output(self) -> bytes:
+        """What was printed since it was last forgotten, which from now on output() leaves out and
+        takes no room."""
+        with Path(self._output.name).open("rb") as printed:
+            printed.seek(self._forgotten)
+            new = printed.read()
+        self._forgotten += len(new)
+        os.truncate(self._output.name, 0)
+        return new
 
     def is_running(self) -> bool:
         if self.status is None:

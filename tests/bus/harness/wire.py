@@ -65,7 +65,7 @@ class Wire:
         self._buffer = b""
         self._serial = 0
         self._authenticate()
-        self._ask_bus("Hello")
+        self.unique_name: str = self._ask_bus("Hello")[0]
         self._ask_bus("AddMatch", GLib.Variant("(s)", (f"type='signal',interface='{INTERFACE}'",)))
 
     def _authenticate(self) -> None:
@@ -85,14 +85,15 @@ class Wire:
         self._socket.sendall(message.to_blob(NO_CAPABILITIES))
         return self._serial
 
-    def _ask_bus(self, member: str, body: GLib.Variant | None = None) -> None:
+    def _ask_bus(self, member: str, body: GLib.Variant | None = None) -> tuple[Any, ...]:
         serial = self._send("org.freedesktop.DBus", "/org/freedesktop/DBus",
                             "org.freedesktop.DBus", member, body)
         while True:
             message = self._receive()
             if message.get_reply_serial() == serial:
                 assert message.get_message_type() == Gio.DBusMessageType.METHOD_RETURN, member
-                return
+                answer = message.get_body()
+                return answer.unpack() if answer else ()
 
     def _fill(self, length: int) -> None:
         while len(self._buffer) < length:

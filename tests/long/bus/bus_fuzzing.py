@@ -21,7 +21,7 @@ from harness.accounts import (CLERK_UID, STANDARD_GROUP, STANDARD_PASSWD, STANDA
 from harness.bus import INTERFACE, NAME, PATH, Bus, BusError, domain_error
 from harness.deadline import wait_for
 from harness.device import Device
-from harness.fake_authz import CODE, DOMAIN, FakeAuthz
+from harness.fake_authz import CODE, DOMAIN, FakeAuthz, PolkitDecides
 from harness.passwords import OLD_HASH
 from harness.service import Service
 from harness.stage import Stage
@@ -72,13 +72,6 @@ CHANGE_ROOT = ("ModifyUser", "ClearUserFields", "ChpasswdUser")
 NO_REPLY = "org.freedesktop.DBus.Error.NoReply"
 
 CAP_SYS_BOOT, CAP_SYS_TIME = 22, 25
-
-
-class Polkit:
-    """In the place of the fake: the sandbox's own decides, which knows root from clerk."""
-
-    def environment(self) -> dict[str, str]:
-        return {}
 
 
 class Sanitized:
@@ -168,11 +161,9 @@ class Fuzzing:
         blobs = [self._generator.broken() for _ in range(BROKEN_MESSAGES)]
         self._may_change_root = is_allowed and any(b"root" in blob for blob in blobs)
         for blob in blobs:
-            line = connect()
-            line.send_raw(blob)
-            line.close()
+            connect().end_with(blob)
             self._figures["broken_messages"] += 1
-        # By then the bus has passed on what came of them, and, as the main loop answers this one, the
+        # The bus has passed on what came of them, and, as the main loop answers this one, the
         # service has served it.
         for _ in range(3):
             self.stage.bus.send(NAME, PATH, "org.freedesktop.DBus.Properties", "GetAll",
@@ -250,7 +241,7 @@ def begin(sanitized: Sanitized, accounts: AccountFiles, bus: Bus, syslog: Syslog
     bounding = int(process.status(os.getpid())["CapBnd"], 16)
     assert not bounding & (1 << CAP_SYS_TIME | 1 << CAP_SYS_BOOT), "this clock is the machine's"
 
-    def begin_stage(authz: FakeAuthz | Polkit) -> Stage:
+    def begin_stage(authz: FakeAuthz | PolkitDecides) -> Stage:
         accounts.write(PASSWD_TEXT, SHADOW_TEXT, GROUP_TEXT)
         stage = Stage(sanitized, bus, authz, syslog, tmp_path, others=device.fakes())
         maps = Path(f"/proc/{stage.service.pid}/maps").read_text()
@@ -295,7 +286,7 @@ class Bout:
         self._chance = chance
         self._figures = figures
 
-    def run(self, amount: int, authz: FakeAuthz | Polkit) -> None:
+    def run(self, amount: int, authz: FakeAuthz | PolkitDecides) -> None:
         stage = self._begin(authz)
         methods = methods_of(stage.bus)
         assert len(methods) == METHOD_COUNT
@@ -331,7 +322,7 @@ class Bout:
         fuzzing.forget()
 
     def _refused(self, fuzzing: Fuzzing, methods: dict[str, tuple[str, str]],
-                 batch: Sequence[str], authz: FakeAuthz | Polkit) -> None:
+                 batch: Sequence[str], authz: FakeAuthz | PolkitDecides) -> None:
         before, known = world(fuzzing.stage.cfgstore), fuzzing.known()
         lines, refusal = self._callers.clerk, refusal_by_polkit
         if isinstance(authz, FakeAuthz):
@@ -358,7 +349,7 @@ def test_fake_authorization(bout: Bout, authz: FakeAuthz, amount: int) -> None:
 
 
 def test_polkit(bout: Bout, amount: int) -> None:
-    bout.run(max(1, int(amount * POLKIT_SHARE)), Polkit())
+    bout.run(max(1, int(amount * POLKIT_SHARE)), PolkitDecides())
 
 
 def test_all_was_asked(figures: Counter[str], amount: int) -> None:

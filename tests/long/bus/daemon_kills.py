@@ -24,6 +24,11 @@ from temporary_watch import TemporaryWatch
 # The random kills begin so often with the files as they were at first.
 KILLS_BETWEEN_FRESH = 20
 
+# Of the random kills, those that leave calls unanswered. And kills until one came between the files
+# of a change, however few are asked for.
+LEAST_SHARE_UNDER_WAY = 0.5
+MOST_KILLS_UNTIL_BETWEEN_FILES = 100
+
 
 @pytest.fixture
 def killed(start: StartService, bus: Bus, authz: FakeAuthz, syslog: SyslogSocket,
@@ -85,13 +90,17 @@ def test_kill_at_random(killed: KilledService, watch: TemporaryWatch, amount: in
                         chance: random.Random, figures: Counter[str]) -> None:
     load = KillLoad(killed, chance, figures)
     try:
-        for number in range(amount - figures["boundary_points"]):
-            if number % KILLS_BETWEEN_FRESH == 0:
+        wanted = amount - figures["boundary_points"]
+        while (kills := figures["random_kills"]) < wanted or (
+                not figures["kills_between_files"] and kills < MOST_KILLS_UNTIL_BETWEEN_FILES):
+            if kills % KILLS_BETWEEN_FRESH == 0:
                 load.begin_afresh()
             load.strike()
             figures["points"] += 1
             figures["random_kills"] += 1
     finally:
         load.close()
-    assert load.answered + load.unanswered > 0
+    assert figures["calls"] > 0
+    assert figures["kills_between_files"] > 0
+    assert figures["kills_with_calls_under_way"] >= LEAST_SHARE_UNDER_WAY * kills
     watch.require_nothing_read()

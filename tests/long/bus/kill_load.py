@@ -6,19 +6,28 @@ import random
 import select
 import time
 from collections import Counter
-from typing import Any
+from contextlib import contextmanager
+from typing import Any, Iterator
 
-from gi.repository import Gio, GLib
+from gi.repository import Gio
 
 from account_history import Call, History
 from harness.bus import INTERFACE, NAME, BusError
+from harness.monitor import Monitor
 from harness.passwords import MARK
 from harness.wire import Wire
+from kill_points import Tracer
 from killed_service import SIGNATURES, KilledService, same_error
 
 CALLERS = 3
 WINDOW = 2
 LONGEST_MS = 60
+
+# In half of the cases the disk is slow, so that the service is killed in the midst of writing and
+# not of hashing: each of these calls on an account file takes so much longer.
+SLOW_SHARE = 0.5
+SLOW_CALLS = "rename,renameat,fsync"
+SLOWNESS_US = 2000
 
 USERS = ("carol", "dave", "erin", "frank")
 SYSTEM_USERS = ("ftpd", "httpd", "snmpd")
@@ -26,37 +35,20 @@ STANDING = ("alice", "bob", "timer", "root")
 GROUPS = ("guests", "staff", "night")
 PRIMARY = ("users", "viewer", "operator")
 
+# Every call to the service, every answer, and who owns its name.
+SEEN = (f"type='method_call',interface='{INTERFACE}'", "type='method_return'", "type='error'",
+        f"type='signal',member='NameOwnerChanged',arg0='{NAME}'")
 
-class Monitor(Wire):
-    """Sees every call to the service, every answer, and who owns which name."""
 
-    def __init__(self) -> None:
-        super().__init__()
-        rules = [f"type='method_call',interface='{INTERFACE}'", "type='method_return'",
-                 "type='error'", f"type='signal',member='NameOwnerChanged',arg0='{NAME}'"]
-        serial = self._send("org.freedesktop.DBus", "/org/freedesktop/DBus",
-                            "org.freedesktop.DBus.Monitoring", "BecomeMonitor",
-                            GLib.Variant("(asu)", (rules, 0)))
-        while self._receive().get_reply_serial() != serial:
-            pass
+def is_call(message: Gio.DBusMessage, call: Call) -> bool:
+    body = message.get_body()
+    return message.get_member() == call[0] and body is not None and body.unpack() == call[1:]
 
-    def skip_to(self, call: Call) -> None:
-        """Forgets what came before a call that is under way or was made."""
-        while True:
-            message = self._receive()
-            body = message.get_body()
-            if message.get_member() == call[0] and body and body.unpack() == call[1:]:
-                return
 
-    def until_gone(self, owner: str) -> list[Gio.DBusMessage]:
-        """All up to the moment at which the owner of the service's name lost it."""
-        messages = []
-        while True:
-            message = self._receive()
-            if (message.get_member() == "NameOwnerChanged"
-                    and message.get_body().unpack()[1:] == (owner, "")):
-                return messages
-            messages.append(message)
+def is_loss_of_name(message: Gio.DBusMessage, owner: str) -> bool:
+    """The owner of the service's name is it no more."""
+    return (message.get_member() == "NameOwnerChanged"
+            and message.get_body().unpack()[1:] == (owner, ""))
 
 
 class Caller(Wire):
@@ -89,11 +81,9 @@ class KillLoad:
         self._chance = chance
         self._figures = figures
         self._callers = [Caller() for _ in range(CALLERS)]
-        self._monitor = Monitor()
+        self._monitor = Monitor(*SEEN)
         self._passwords = 0
         self._marks = 0
-        self.answered = 0
-        self.unanswered = 0
 
     def close(self) -> None:
         for wire in (*self._callers, self._monitor):
@@ -108,19 +98,34 @@ class KillLoad:
         self._marks += 1
         mark = ("CheckUser", f"mark {self._marks}")
         assert killed.call(mark) is None
-        self._monitor.skip_to(mark)
+        self._monitor.until(lambda message: is_call(message, mark))
         history = History(killed.hashes)
         owner = killed.bus.owner()
         assert owner is not None
-        self._load(self._chance.uniform(0, LONGEST_MS) / 1000)
-        killed.kill()
-        calls, answers = self._seen(self._monitor.until_gone(owner), owner)
+        with self._disk():
+            self._load(self._chance.uniform(0, LONGEST_MS) / 1000)
+            killed.kill()
+        seen = self._monitor.until(lambda message: is_loss_of_name(message, owner))
+        calls, answers = self._seen(seen, owner)
         self._drain()
         try:
             interrupted = self._judge(history, calls, answers)
             killed.recover(interrupted)
         except AssertionError as error:
             raise AssertionError(f"calls {calls}, answers {answers}: {error}") from error
+
+    @contextmanager
+    def _disk(self) -> Iterator[None]:
+        """A slow one or not."""
+        if self._chance.random() >= SLOW_SHARE:
+            yield
+            return
+        tracer = Tracer(self._killed.service.pid, "-e", f"trace={SLOW_CALLS}",
+                        "-e", f"inject={SLOW_CALLS}:delay_exit={SLOWNESS_US}")
+        try:
+            yield
+        finally:
+            tracer.end()
 
     def _load(self, seconds: float) -> None:
         end = time.monotonic() + seconds
@@ -175,12 +180,10 @@ class KillLoad:
                         else isinstance(answer, BusError) and same_error(answer, refusal))
                 assert same, f"{call} is answered {answer} and not {refusal}"
                 answered = history.newest
-        self.answered += len(answers)
-        self.unanswered += len(calls) - len(answers)
         self._figures["calls"] += len(answers)
+        self._figures["kills_with_calls_under_way"] += len(calls) > len(answers)
         place = self._killed.judge(history, answered)
-        if place.ahead:
-            self._figures["kills_between_files"] += 1
+        self._figures["kills_between_files"] += bool(place.ahead)
         begun = [call for call, newest in zip(calls, last_versions) if newest > place.whole]
         return begun[0] if begun and len(answers) < len(calls) else None
 

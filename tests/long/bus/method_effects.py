@@ -2,11 +2,11 @@
 import re
 from dataclasses import dataclass
 
-from bus_monitor import SIGNAL, Seen
 from harness.bus import BusError
 from harness.device import (ETHTOOL, LLDPCLI, NETSTAT, PINSRV, SMARTCTL, SYSFLASH,
                             TIME_SYNC_HOOK)
 from harness.interface import Method
+from harness.monitor import SIGNAL, Seen
 from pipeline import Answer
 
 SYSTEMD = "org.freedesktop.systemd1"

@@ -1,6 +1,8 @@
 """tests/long/bus/pipeline.py: bus connections that send many calls before the first is answered."""
 import itertools
 import select
+import socket
+from contextlib import suppress
 from dataclasses import dataclass, field
 from typing import Any, Callable, Iterable, Sequence
 
@@ -65,9 +67,8 @@ def _answer(message: Gio.DBusMessage) -> Answer:
 class Pipeline(Wire):
     """A connection of the effective user, which gets no signals of the service."""
 
-    def _ask_bus(self, member: str, body: GLib.Variant | None = None) -> None:
-        if member != "AddMatch":
-            super()._ask_bus(member, body)
+    def _ask_bus(self, member: str, body: GLib.Variant | None = None) -> tuple[Any, ...]:
+        return super()._ask_bus(member, body) if member != "AddMatch" else ()
 
     def __init__(self) -> None:
         self.outstanding: dict[int, Call] = {}
@@ -92,8 +93,16 @@ class Pipeline(Wire):
             self._unheard.append(self._serial)
         self._socket.sendall(message.to_blob(NO_CAPABILITIES))
 
-    def send_raw(self, blob: bytes) -> None:
-        self._socket.sendall(blob)
+    def end_with(self, blob: bytes) -> None:
+        """Sends these bytes as the last ones, and returns when the bus has read them and closed the
+        connection: the bus drops unread what comes right before an end."""
+        self._socket.settimeout(ANSWER_SECONDS)
+        with suppress(BrokenPipeError, ConnectionResetError):  # it had read enough
+            self._socket.sendall(blob)
+            self._socket.shutdown(socket.SHUT_WR)
+            while self._socket.recv(1 << 16):
+                pass
+        self.close()
 
     def arrived(self) -> list[tuple[Call, Answer]]:
         """The answers that one read brings."""

@@ -1,4 +1,4 @@
-"""tests/long/bus/polkit_control.py: polkitd stopped, gone, replaced, or answering nonsense."""
+"""tests/long/bus/polkit_control.py: polkitd gone, replaced, or answering nonsense."""
 import contextlib
 import os
 import pwd
@@ -12,10 +12,9 @@ from typing import Iterator
 
 from gi.repository import Gio, GLib
 
-from harness import process
 from harness.bus import Bus
 from harness.deadline import wait_for
-from harness.polkit import POLICIES, actions
+from harness.polkit import ANSWER_SECONDS, POLICIES, actions
 from harness.sandbox import STATE, polkitd_pid
 from harness.wire import NO_CAPABILITIES, as_user
 from pipeline import Pipeline
@@ -35,31 +34,12 @@ class PolkitControl:
     def __init__(self, bus: Bus) -> None:
         self._bus = bus
 
-    def _signal(self, number: signal.Signals) -> None:
-        os.kill(polkitd_pid(), number)
-
     def owner(self) -> str | None:
         return self._bus.owner(NAME)
 
-    def stop(self) -> None:
-        self._signal(signal.SIGSTOP)
-        wait_for("polkitd's stop",
-                 lambda: process.status(polkitd_pid())["State"].startswith("T"))
-
-    def go_on(self) -> None:
-        self._signal(signal.SIGCONT)
-
-    @contextmanager
-    def hanging(self) -> Iterator[None]:
-        self.stop()
-        try:
-            yield
-        finally:
-            self.go_on()
-
-    def end(self, number: signal.Signals = signal.SIGKILL) -> None:
-        self._signal(number)
-        wait_for("polkitd's end", lambda: self.owner() is None)
+    def end(self) -> None:
+        os.kill(polkitd_pid(), signal.SIGKILL)
+        wait_for("polkitd's end", lambda: self.owner() is None, ANSWER_SECONDS)
 
     def start(self, *arguments: str) -> None:
         """Returns when it is the owner of the name."""
@@ -68,7 +48,8 @@ class PolkitControl:
         started = subprocess.Popen([program, "--no-debug", *arguments], stdout=subprocess.DEVNULL,
                                    stderr=subprocess.DEVNULL)
         (STATE / "polkitd.pid").write_text(f"{started.pid}\n")
-        wait_for("the new polkitd", lambda: self.owner() not in (None, old), 20)
+        wait_for("the new polkitd", lambda: self.owner() not in (None, old),
+                 ANSWER_SECONDS)
 
     def replace_hanging(self) -> None:
         """A new one takes the name of one that is stopped, which then is killed."""
@@ -92,11 +73,11 @@ class PolkitControl:
         aside = POLICY.with_suffix(".aside")
         POLICY.rename(aside)
         try:
-            wait_for("actions to go", lambda: count() == 0, 20)
+            wait_for("actions to go", lambda: count() == 0, ANSWER_SECONDS)
             yield
         finally:
             aside.rename(POLICY)
-            wait_for("actions to come back", lambda: count() > 0, 20)
+            wait_for("actions to come back", lambda: count() > 0, ANSWER_SECONDS)
 
 
 class NonsensePolkit(Pipeline):

@@ -1,38 +1,36 @@
 """tests/long/bus/races.py: callers that vanish, and others that write the account files.
 
-A trial is one connection that is made to be left, one change that another program races with, or
-one service that another one follows; 0 of the refused ones may do anything.
+A trial is one call that reached the service from a connection that was made to be left, one change
+that another program races with, or one service that another one follows; 0 of the refused ones may
+do anything.
 """
-import json
+import math
 import random
 import signal
-import subprocess
 import threading
-import time
 from collections import Counter
 from pathlib import Path
 from typing import Callable, Iterator
 
 import pytest
-from gi.repository import Gio, GLib
 
 from account_watch import require_agreement, rows
-from bus_monitor import BUS, CALL, ERROR, Monitor
-from harness.accounts import (CLERK_UID, GROUP, PASSWD, SHADOW, STANDARD_GROUP, STANDARD_PASSWD,
+from harness.accounts import (GROUP, PASSWD, SHADOW, STANDARD_GROUP, STANDARD_PASSWD,
                               STANDARD_SHADOW, AccountFiles)
-from harness.bus import INTERFACE, NAME, PATH, Bus
+from harness.bus import NAME, Bus
 from harness.deadline import wait_for
 from harness.device import SYSFLASH, Device
-from harness.interface import METHODS, QUERIES
-from harness.sandbox import PYTHON, SYSTEM_BUS
+from harness.fake_authz import PolkitDecides
+from harness.interface import METHODS
+from harness.monitor import BUS, CALL, ERROR, Record, is_end_of
 from harness.service import Service
 from harness.stage import PIDOF, Stage
 from harness.stage_fixtures import run_stage
 from harness.syslog_socket import SyslogSocket
-from harness.wire import NO_CAPABILITIES
+from other_writers import Outsider, Reader
 from pipeline import Call, Pipeline
 from polkit_control import NAME as POLKIT
-from other_writers import Outsider, Reader
+from racing import CONNECTIONS_TO_A_CALL, RACERS, Racer, Races
 from surroundings import differences, world
 
 # Of the trials; those of the refused callers are the rest.
@@ -43,32 +41,10 @@ SINGLE_TRIALS = 2
 CHANGES_TO_A_RACE = 20
 LOST = "/etc/passwd was changed by another program; its changes are lost"
 
-RACERS = 3
-WARNING = "warning: Authorization check failed: "
-
-# What was sent on a connection that then ended, the bus may drop unread.
-LEAST_ARRIVALS = 0.3
+# Callers that vanish until so many of their calls have arrived, and some were both served and left.
+CALLERS_TO_A_CALL = 20
 
 LINGER_MS = 60
-SETTLE_SECONDS = 10.0
-
-# The actions that somebody who means harm would ask for.
-TEMPTING = {
-    "AddUser": ("evil", "secret", "root", "privane", ""),
-    "AddUidUser": ("evil", "secret", "root", "privane", "", 1500),
-    "AddSystemUser": ("evil", "secret", "root", ["privane"], "/bin/sh", ""),
-    "ModifyUser": ("root", "mine now", "", [], "", ""),
-    "ChpasswdUser": ("root", "mine now"),
-    "ClearUserFields": ("root", True, True, True),
-    "RemoveUser": ("viewer",),
-}
-
-
-class Polkit:
-    """In the place of a fake library: polkit itself decides."""
-
-    def environment(self) -> dict[str, str]:
-        return {}
 
 
 @pytest.fixture
@@ -76,12 +52,13 @@ def stage(accounts: AccountFiles, device: Device, hardware_clock: Path,
           start: Callable[..., Service], bus: Bus, syslog: SyslogSocket,
           tmp_path: Path) -> Iterator[Stage]:
     accounts.write(STANDARD_PASSWD, STANDARD_SHADOW.replace(":7:::", ":7:0::"), STANDARD_GROUP)
-    yield from run_stage(Stage(start, bus, Polkit(), syslog, tmp_path, others=device.fakes()))
+    yield from run_stage(Stage(start, bus, PolkitDecides(), syslog, tmp_path,
+                               others=device.fakes()))
 
 
 @pytest.fixture
-def monitor() -> Iterator[Monitor]:
-    listener = Monitor()
+def monitor() -> Iterator[Record]:
+    listener = Record()
     yield listener
     listener.close()
 
@@ -90,102 +67,29 @@ def share(amount: int, part: float) -> int:
     return max(4, int(amount * part))
 
 
-def rest(amount: int) -> list[int]:
-    """The trials of each racer."""
+def rest(amount: int) -> int:
+    """The trials of the refused callers."""
     others = SINGLE_TRIALS + sum(share(amount, part) for part in (
         ALLOWED_SHARE, WRITERS_SHARE, INSTANCES_SHARE))
-    left = max(RACERS, amount - others)
-    return [left // RACERS + (number < left % RACERS) for number in range(RACERS)]
+    return max(RACERS, amount - others)
 
 
-def blob(serial: int, destination: str, path: str, interface: str, member: str,
-         body: GLib.Variant | None = None) -> bytes:
-    message = Gio.DBusMessage.new_method_call(destination, path, interface, member)
-    message.set_serial(serial)
-    if body is not None:
-        message.set_body(body)
-    return message.to_blob(NO_CAPABILITIES)
-
-
-def beginning(uid: int) -> bytes:
-    """All that a connection says before its first call, without waiting for an answer."""
-    return (b"\0AUTH EXTERNAL " + str(uid).encode().hex().encode() + b"\r\nBEGIN\r\n"
-            + blob(1, BUS, "/org/freedesktop/DBus", BUS, "Hello"))
-
-
-def tempting_calls() -> list[bytes]:
-    return [blob(2, NAME, PATH, INTERFACE, method.member,
-                 GLib.Variant(f"({method.signature})",
-                              tuple(TEMPTING.get(method.member, method.arguments))))
-            for method in METHODS if method not in QUERIES]
-
-
-class Racer:
-    """A process of clerk, who is in the group privane and has no role."""
-
-    def __init__(self, gid: int, trials: int, seed: int) -> None:
-        self._process = subprocess.Popen(
-            ["setpriv", f"--reuid={CLERK_UID}", f"--regid={CLERK_UID}", f"--groups={gid}", "--",
-             PYTHON, str(Path(__file__).with_name("racer.py"))],
-            stdin=subprocess.PIPE, stdout=subprocess.PIPE, text=True)
-        assert self._process.stdin is not None
-        json.dump({"socket": SYSTEM_BUS.removeprefix("unix:path="), "trials": trials,
-                   "seed": seed, "begin": beginning(CLERK_UID).hex(),
-                   "calls": [call.hex() for call in tempting_calls()]}, self._process.stdin)
-        self._process.stdin.write("\n")
-        self._process.stdin.flush()
-
-    def is_running(self) -> bool:
-        return self._process.poll() is None
-
-    def result(self) -> dict[str, int]:
-        assert self._process.stdout is not None and self._process.stdin is not None
-        result: dict[str, int] = json.loads(self._process.stdout.read())
-        self._process.stdin.close()
-        assert self._process.wait(10) == 0
-        return result
-
-
-def settle(bus: Bus, service: Service, monitor: Monitor) -> list[str]:
-    """Waits until the service has told of every call that reached it, or has told enough not to
-    have; what it told."""
-    end = time.monotonic() + SETTLE_SECONDS
-    while len(warnings(service)) != len(foreign_calls(bus, monitor)) and time.monotonic() < end:
-        assert service.is_running(), service.output()[-3:]
-        assert bus.call("CheckUser", "s", "root") == (True,)
-    return warnings(service)
-
-
-def warnings(service: Service) -> list[str]:
-    return [line for line in service.output() if line.startswith(WARNING)]
-
-
-def foreign_calls(bus: Bus, monitor: Monitor) -> list[str]:
-    """The members called by others than this process's own connections."""
-    root = {seen.sender for seen in monitor.since(0) if seen.member == "CheckUser"}
-    return [str(seen.member) for seen in monitor.since(0)
-            if seen.type == CALL and seen.destination == NAME and seen.sender not in root]
-
-
-def test_refused_callers_that_vanish(stage: Stage, device: Device, monitor: Monitor,
+def test_refused_callers_that_vanish(stage: Stage, device: Device, monitor: Record,
                                      privane_gid: int, chance: random.Random, amount: int,
                                      figures: Counter[str]) -> None:
     bus, service = stage.bus, stage.service
     unique_name = bus.owner()
     assert bus.call("CheckUser", "s", "root") == (True,)
     begin_output, before = service.output(), world(stage.cfgstore)
-    racers = [Racer(privane_gid, trials, chance.getrandbits(32)) for trials in rest(amount)]
-    mark = monitor.mark()
+    mark, wanted = monitor.mark(), rest(amount)
+    races = Races(bus, service, monitor)
 
-    while any(racer.is_running() for racer in racers):
-        # Root comes right after one that went: allowed as itself, and nobody else is by that.
-        line = Pipeline()
-        serial = line.send("CheckUser", "s", "root")
-        assert [message.body for message in line.until_reply(serial)] == [(True,)]
-        line.close()
-        figures["roots_in_between"] += 1
-    results = [racer.result() for racer in racers]
-    told = settle(bus, service, monitor)
+    while (arrived := len(races.calls())) < wanted:
+        connections = math.ceil((wanted - arrived) * CONNECTIONS_TO_A_CALL / RACERS)
+        races.run([Racer(privane_gid, connections, chance.getrandbits(32))
+                   for _ in range(RACERS)])
+        assert len(races.calls()) > arrived, "nothing arrives"
+    told = races.told()
 
     after = world(stage.cfgstore)
     assert after == before, differences(before, after)
@@ -193,11 +97,9 @@ def test_refused_callers_that_vanish(stage: Stage, device: Device, monitor: Moni
     assert service.output() == begin_output + told
     require_only_refusals(monitor, mark, unique_name)
     require_new_names(monitor)
-    arrived = len(foreign_calls(bus, monitor))
-    assert arrived == len(told)
-    assert arrived > LEAST_ARRIVALS * sum(result["whole"] for result in results)
-    figures["trials"] += sum(result["trials"] for result in results)
-    figures["calls_sent"] += sum(result["whole"] for result in results)
+    assert len(told) == arrived
+    figures.update(races.counts)
+    figures["trials"] += arrived
     figures["calls_arrived"] += arrived
     figures["gone_when_asked_for"] += sum("uid is not known" in line or "no such name" in line
                                           for line in told)
@@ -205,7 +107,7 @@ def test_refused_callers_that_vanish(stage: Stage, device: Device, monitor: Moni
     assert stage.calls() == [(SYSFLASH, "reboot")], "a reset was armed"
 
 
-def require_only_refusals(monitor: Monitor, mark: int, service: str | None) -> None:
+def require_only_refusals(monitor: Record, mark: int, service: str | None) -> None:
     """The service said nothing but errors, questions, and the answers to root."""
     names = {seen.arguments[1] for seen in monitor.since(0) if seen.member == "NameOwnerChanged"
              and seen.arguments[0] == POLKIT}
@@ -217,7 +119,7 @@ def require_only_refusals(monitor: Monitor, mark: int, service: str | None) -> N
             assert seen.arguments == (True,), seen
 
 
-def require_new_names(monitor: Monitor) -> None:
+def require_new_names(monitor: Record) -> None:
     """No unique name is given twice."""
     given = Counter(seen.arguments[0] for seen in monitor.since(0)
                     if seen.member == "NameOwnerChanged" and str(seen.arguments[0]).startswith(":")
@@ -231,23 +133,34 @@ def is_there(name: str) -> tuple[bool, ...]:
     return *in_users, any(name in row[3].split(",") for row in rows(GROUP))
 
 
-def call_and_vanish(call: Call, delay: float) -> None:
+def call_and_vanish(call: Call, delay: float, bus: Bus, monitor: Record) -> bool:
+    """Whether the call was passed on to the service before the bus forgot the caller, as it has."""
+    mark = monitor.mark()
     line = Pipeline()
     line.start(call)
     threading.Event().wait(delay)
     line.close()
+    monitor.wait_for("the caller's end", mark, is_end_of(line.unique_name))
+    monitor.catch_up(bus)
+    return any(seen.type == CALL and seen.sender == line.unique_name and seen.destination == NAME
+               for seen in monitor.since(mark))
 
 
-def test_allowed_callers_that_vanish(stage: Stage, device: Device, monitor: Monitor,
+def test_allowed_callers_that_vanish(stage: Stage, device: Device, monitor: Record,
                                      chance: random.Random, amount: int,
                                      figures: Counter[str]) -> None:
-    """A change is made wholly, with all that belongs to it, or not at all."""
+    """A change is made wholly, with all that belongs to it, or not at all: where polkit does not
+    find the caller any more."""
     signature = next(method.signature for method in METHODS if method.member == "AddUser")
-    for number in range(share(amount, ALLOWED_SHARE)):
+    wanted = share(amount, ALLOWED_SHARE)
+    counts: Counter[str] = Counter()
+    for number in range(CALLERS_TO_A_CALL * wanted):
         name = f"race{number}"
-        call_and_vanish(Call("method", "AddUser", signature,
-                             (name, "secret", "clerk", "privane-viewer", "")),
-                        chance.choice((0, 0, chance.uniform(0, 0.008))))
+        arrived = call_and_vanish(Call("method", "AddUser", signature,
+                                       (name, "secret", "clerk", "privane-viewer", "")),
+                                  chance.choice((0, 0, chance.uniform(0, 0.008))), stage.bus,
+                                  monitor)
+        counts["allowed_calls_that_arrived" if arrived else "allowed_calls_dropped"] += 1
         for _ in range(3):
             stage.bus.call("CheckUser", "s", name)
         (exists,) = stage.bus.call("CheckUser", "s", name)
@@ -256,15 +169,23 @@ def test_allowed_callers_that_vanish(stage: Stage, device: Device, monitor: Moni
         assert stage.bus.call("GetUserList") == (users,)
         tools = [words[0] for words in stage.calls()]
         assert tools == (["digest_entry_set", PIDOF] if exists else []), (name, stage.calls())
-        figures["changes_made" if exists else "changes_not_made"] += 1
-        figures["trials"] += 1
+        assert arrived or not exists
+        if arrived:
+            counts["changes_made" if exists else "changes_not_made"] += 1
         stage.digest.forget()
         stage.pidof.forget()
         if exists:
             stage.bus.call("RemoveUser", "s", name)
             stage.digest.forget()
             stage.pidof.forget()
-    assert figures["changes_made"] > 0
+        if (counts["allowed_calls_that_arrived"] >= wanted and counts["changes_made"]
+                and counts["changes_not_made"]):
+            break
+    assert counts["allowed_calls_that_arrived"] >= wanted, counts
+    assert counts["changes_made"] > 0, "all were gone in time"
+    assert counts["changes_not_made"] > 0, "none was gone in time"
+    figures["trials"] += counts["allowed_calls_that_arrived"]
+    figures.update(counts)
 
 
 @pytest.mark.parametrize("member, tool", [("Reboot", SYSFLASH),

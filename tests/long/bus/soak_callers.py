@@ -77,6 +77,8 @@ class Caller(threading.Thread):
         self.counts: Counter = Counter()
         self.longest_wait = 0.0
         self.failed: BaseException | None = None
+        # A call that comes before those that are drawn.
+        self.wanted: tuple[str, tuple[Any, ...]] | None = None
         self._glass = glass
         self.chance = random.Random(chance.random())
         self.bus = Bus()
@@ -92,6 +94,10 @@ class Caller(threading.Thread):
             self._glass.give_up()
 
     def step(self) -> None:
+        if self.wanted is not None:
+            wanted, self.wanted = self.wanted, None
+            self.call(*wanted)
+            return
         member, arguments = self.chance.choice(QUESTIONS)
         if self.chance.randrange(CALLS_TO_A_TOOL) == 0:
             member, arguments = self.chance.choice(TOOLS)

@@ -57,14 +57,21 @@ class SoakTools:
         """To be called before the records are forgotten."""
         self.counts["tools_run"] += sum(len(tool.calls()) for tool in self._tools.values())
 
-    def hang(self, seconds: float) -> None:
-        """The next run of one of them hangs for so long, and only that."""
+    def hang(self, seconds: float) -> tuple[str, tuple[Any, ...]]:
+        """The next run of one of them hangs for so long, and only that; a call that runs it."""
         GONE_ON.unlink(missing_ok=True)
-        tool = self._tools[self._chance.choice(PATHS)]
+        index = self._chance.randrange(len(PATHS))
+        tool = self._tools[PATHS[index]]
         self.note_runs()
         tool.forget()
         tool.before_answering(f'rm -- "$0"\nsleep {seconds}\n: >{GONE_ON}')
         self._hung = tool, seconds
+        return TOOLS[index]
+
+    @property
+    def awaits_hang(self) -> bool:
+        """Whether that has not been counted yet."""
+        return self._hung is not None
 
     def is_hanging(self) -> bool:
         """Whether it is still to hang, or does. When it does no more, that is counted."""
