@@ -2,12 +2,14 @@
 
 A proof is a command that takes --amount N, --seed S and --figures FILE. It does about N of its unit,
 draws everything random from the seed, and writes its counts to FILE as a JSON object, where names that
-begin with "max_" are maxima and all others are sums. Exit status 0 tells that nothing failed.
+begin with "max_" are maxima and all others are sums. Of its unit, "max_exhaustive_UNIT" are those that
+every start does again, whatever its seed. Exit status 0 tells that nothing failed.
 """
 import json
 import sys
 import tempfile
 import time
+from collections.abc import Sequence
 from dataclasses import dataclass
 from pathlib import Path
 
@@ -17,24 +19,32 @@ TREE = Path(__file__).resolve().parents[2]
 
 Counts = dict[str, int | float]
 
-# Of the amount that a proof is told, which it may miss a little.
+SECONDS = "seconds"
+
+# Of the seconds that a proof is told, which it may miss a little; all else can be counted out.
 LEAST_SHARE = 0.9
+
+# Between the name of a family of rows and what tells them apart.
+OF = ":"
 
 
 @dataclass(frozen=True)
 class Proof:
-    """unit is the count by which a proof is measured. gate is the amount of ./test proof, step that
-    of one start in a long run, aim what one night should reach, and full what many should. patience
-    is how many seconds a unit may take, several times what it does on two busy cores."""
+    """A row. unit is the count by which it is measured. gate is the amount of ./test proof, step that
+    of one start in a long run, aim what one night should reach, and full what many should; a row
+    without gate or without aim has no part in the one or in the other. pace is how many seconds a
+    unit takes, as long as no start has shown it, and patience how many it may: several times what it
+    does on two busy cores."""
 
     name: str
     command: tuple[str, ...]
     unit: str
-    gate: int
-    step: int
-    aim: int
-    full: int
+    pace: float
     patience: float
+    gate: int = 0
+    step: int = 0
+    aim: int = 0
+    full: int = 0
     build: str = "build"
     # A proof that keeps both cores busy, or measures time, has the machine to itself.
     cores: int = 1
@@ -44,6 +54,14 @@ class Proof:
     def limit(self, amount: int) -> float:
         """The seconds after which a start of so many units is given up."""
         return self.patience_to_start + self.patience * amount
+
+    def least(self, amount: int) -> float:
+        """What a start that was told this amount has to count."""
+        return LEAST_SHARE * amount if self.unit == SECONDS else amount
+
+    @property
+    def family(self) -> str:
+        return self.name.split(OF)[0]
 
 
 @dataclass(frozen=True)
@@ -58,40 +76,69 @@ def on_bus(name: str, build: str = "build") -> tuple[str, ...]:
     return ("tests/long/on_bus", f"--build={build}", name)
 
 
+def fuzzing(target: str) -> Proof:
+    """In a long run each target counts for itself, and those that are behind are fuzzed most."""
+    step, pace = (100_000, 0.0015) if target in SLOW_TARGETS else (500_000, 0.0003)
+    return Proof(f"fuzzing{OF}{target}", ("tests/fuzz/run", "--of=executions", f"--target={target}"),
+                 "executions", pace=pace, step=step, aim=10_000_000, full=100_000_000,
+                 patience=0.02, build="build-fuzz")
+
+
+TARGETS = sorted(folder.name for folder in (TREE / "tests/fuzz/corpus").iterdir() if folder.is_dir())
+
+# They execute less than a thousand inputs a second.
+SLOW_TARGETS = ("operations", "replies")
+
 PROOFS: tuple[Proof, ...] = (
     Proof("kill_points", ("build/tests/long/faults/kill_points",), "points",
-          gate=13_000, step=50_000, aim=200_000, full=2_000_000, patience=0.1),
+          gate=13_000, step=50_000, aim=200_000, full=2_000_000, pace=0.003, patience=0.1),
     Proof("failing_calls", ("build/tests/long/faults/failing_calls",), "faults",
-          gate=17_000, step=50_000, aim=200_000, full=2_000_000, patience=0.1),
+          gate=17_000, step=50_000, aim=200_000, full=2_000_000, pace=0.003, patience=0.1),
+    # A step holds every boundary, and is all there is to do; what is random goes on in a row of its
+    # own, which does not repeat them.
     Proof("daemon_kills", on_bus("daemon_kills"), "points",
-          gate=300, step=12_500, aim=12_500, full=25_000, patience=2),
+          gate=300, step=2_800, aim=2_800, full=2_800, pace=0.14, patience=2),
+    Proof(f"daemon_kills{OF}random", (*on_bus("daemon_kills"), "-ktest_kill_at_random"),
+          "random_kills", step=1_000, aim=10_000, full=25_000, pace=0.14, patience=2),
     Proof("power_cuts", ("tests/long/power/power_cuts",), "states",
-          gate=3_000, step=12_000, aim=50_000, full=250_000, patience=0.1, cores=2),
-    Proof("fuzzing", ("tests/fuzz/run",), "seconds",
-          gate=10, step=60, aim=480, full=2_400, patience=40, build="build-fuzz", cores=2),
+          gate=3_000, step=6_000, aim=50_000, full=250_000, pace=0.04, patience=0.1, cores=2),
+    Proof("fuzzing", ("tests/fuzz/run", "--of=seconds"), SECONDS,
+          gate=10, pace=9, patience=40, build="build-fuzz", cores=2),
+    *map(fuzzing, TARGETS),
     Proof("bus_fuzzing", on_bus("bus_fuzzing", "build-sanitize"), "calls",
-          gate=46_000, step=46_000, aim=460_000, full=1_000_000, patience=0.05,
+          gate=46_000, step=46_000, aim=460_000, full=1_000_000, pace=0.002, patience=0.05,
           build="build-sanitize"),
     Proof("authorization_matrix", on_bus("authorization_matrix"), "cells",
-          gate=368, step=368, aim=1_104, full=3_680, patience=5),
+          gate=368, step=368, aim=368, full=368, pace=0.15, patience=5),
     Proof("races", on_bus("races"), "trials",
-          gate=5_000, step=5_000, aim=25_000, full=100_000, patience=0.2),
-    Proof("soak", on_bus("soak"), "seconds",
-          gate=60, step=1_800, aim=1_800, full=28_800, patience=3),
-    Proof("flood", on_bus("flood"), "seconds",
-          gate=10, step=60, aim=60, full=600, patience=60, cores=2),
+          gate=5_000, step=5_000, aim=25_000, full=100_000, pace=0.02, patience=0.2),
+    # Whole: what grows slowly shows in one long start only.
+    Proof("soak", on_bus("soak"), SECONDS,
+          gate=60, step=1_800, aim=1_800, full=28_800, pace=1.05, patience=3),
+    Proof("flood", on_bus("flood"), SECONDS,
+          gate=10, step=20, aim=60, full=600, pace=13, patience=60, cores=2),
     Proof("daemon_secrets", on_bus("daemon_secrets"), "calls",
-          gate=400, step=400, aim=2_000, full=20_000, patience=3),
+          gate=400, step=2_000, aim=2_000, full=20_000, pace=0.03, patience=3),
     Proof("seeded_defects", ("tests/long/seeded/run",), "defects",
-          gate=8, step=8, aim=8, full=8, patience=600, cores=2),
+          gate=8, step=8, aim=8, full=8, pace=20, patience=600, cores=2),
 )
 
 
-def named(names: list[str]) -> list[Proof]:
-    """All of them without a name; ends the program at an unknown one."""
-    if unknown := set(names) - {proof.name for proof in PROOFS}:
+def of_gate(names: Sequence[str] = ()) -> list[Proof]:
+    return _named(names, [proof for proof in PROOFS if proof.gate])
+
+
+def of_long_run(names: Sequence[str] = ()) -> list[Proof]:
+    return _named(names, [proof for proof in PROOFS if proof.aim])
+
+
+def _named(names: Sequence[str], rows: list[Proof]) -> list[Proof]:
+    """All of them without a name; a family's name stands for its rows. Ends the program at an
+    unknown one."""
+    known = {name for proof in rows for name in (proof.name, proof.family)}
+    if unknown := set(names) - known:
         sys.exit(f"no such proof: {', '.join(sorted(unknown))}")
-    return [proof for proof in PROOFS if proof.name in names or not names]
+    return [proof for proof in rows if {proof.name, proof.family} & set(names) or not names]
 
 
 def run(proof: Proof, amount: int, seed: int, groups: ProcessGroups | None = None) -> Outcome:
@@ -111,7 +158,7 @@ def run(proof: Proof, amount: int, seed: int, groups: ProcessGroups | None = Non
         said = printed.read_text(errors="backslashreplace")
         counts = read_counts(figures)
     passed = (status == 0 and counts.get("failures", 1) == 0
-              and counts.get(proof.unit, 0) >= LEAST_SHARE * amount)
+              and counts.get(proof.unit, 0) >= proof.least(amount))
     return Outcome(passed, counts, f"$ {' '.join(command)}\n{said}({end})\n", seconds)
 
 

@@ -23,7 +23,7 @@ def script(name: str) -> ModuleType:
 
 
 def proof_of(text: str, cores: int = 1, name: str = "sample", aim: int = 100,
-             patience_to_start: float = 60) -> Proof:
+             patience_to_start: float = 60, unit: str = "points", pace: float = 0.001) -> Proof:
     """A proof that runs this Python text; "amount", "seed" and "figures" are what it was told."""
     program = ("import argparse, json, os, pathlib, subprocess, sys, time\n"
                "parser = argparse.ArgumentParser()\n"
@@ -31,8 +31,9 @@ def proof_of(text: str, cores: int = 1, name: str = "sample", aim: int = 100,
                "parser.add_argument('--figures', type=pathlib.Path)\n"
                "told = parser.parse_args()\n"
                "def count(**counts): told.figures.write_text(json.dumps(counts))\n" + text)
-    return Proof(name, ("/usr/bin/python3", "-c", program), "points", gate=5, step=10, aim=aim,
-                 full=10 * aim, patience=0.01, cores=cores, patience_to_start=patience_to_start)
+    return Proof(name, ("/usr/bin/python3", "-c", program), unit, gate=5, step=10, aim=aim,
+                 full=10 * aim, pace=pace, patience=0.01, cores=cores,
+                 patience_to_start=patience_to_start)
 
 
 def await_it(holds: Callable[[], bool], seconds: float = 20) -> None:

@@ -5,6 +5,7 @@ import os
 import signal
 import subprocess
 import sys
+import time
 from pathlib import Path
 from types import ModuleType
 
@@ -56,6 +57,23 @@ def test_figures_add_up_over_runs_and_trees(tmp_path: Path) -> None:
     assert "3 starts that passed on a: 4, b-dirty (changes in no commit): 4" in shown
 
 
+def test_what_every_start_repeats_counts_once(figures: Figures) -> None:
+    proof = proof_of("")
+    for seed, points, exhaustive, tree in ((2, 50, 40, "a"), (3, 60, 40, "a"), (4, 41, 41, "b")):
+        figures.add(proof, 1, seed, passed(points=points, max_exhaustive_points=exhaustive,
+                                           operations=7), tree)
+    assert figures.counts(proof) == {"points": 71, "max_exhaustive_points": 41, "operations": 21}
+    assert figures.done(proof) == 71
+    assert figures.trees(proof) == {"a": 70, "b": 41}
+
+
+def test_a_proof_that_is_all_repetition_is_done_once(figures: Figures) -> None:
+    proof = proof_of("", aim=368)
+    for seed in (2, 3, 4):
+        figures.add(proof, 368, seed, passed(cells=368, points=368, max_exhaustive_points=368), "a")
+        assert figures.done(proof) == 368
+
+
 def test_a_failure_is_kept_and_named_and_counts_nothing(figures: Figures, tmp_path: Path) -> None:
     proof = proof_of("")
     figures.add(proof, 5, 2, passed(points=5), "a")
@@ -73,13 +91,26 @@ def test_a_failure_is_kept_and_named_and_counts_nothing(figures: Figures, tmp_pa
 
 
 def test_the_least_fuzzed_target_is_shown(figures: Figures) -> None:
-    proof = proof_of("")
-    for seed, load, hashes in ((2, 50, 700), (3, 60, 10)):
-        figures.add(proof, 1, seed, passed(points=1, executions=9, executions_load=load,
-                                           executions_hashes=hashes, executions_replies=900), "a")
-    shown = details(figures, proof)
-    assert "110 executions of load, the least of 3 targets" in shown
-    assert "710" not in shown and "18 executions" in shown
+    load, hashes, alone = proof_of("", name="fuzzing:load"), proof_of("", name="fuzzing:hashes"), \
+        proof_of("", name="races")
+    for seed, proof, points in ((2, load, 50), (2, hashes, 700), (3, load, 60), (2, alone, 1)):
+        figures.add(proof, 1, seed, passed(points=points, executions_load=5), "a")
+    shown = "\n".join(figures.lines((load, hashes, alone)))
+    assert "fuzzing: 110 points of load, the least of 2" in shown
+    assert shown.count("the least of") == 1
+    assert "executions load" not in shown
+
+
+def test_the_table_holds_what_ran_and_what_failed(figures: Figures) -> None:
+    proof, other = proof_of(""), proof_of("", name="other")
+    figures.add(proof, 3, 2, passed(points=3_000, max_exhaustive_points=2_000, looks=4), "a")
+    figures.add(proof, 3, 3, passed(points=2_500, max_exhaustive_points=2_000, looks=4), "b-dirty")
+    figures.add(proof, 3, 4, Outcome(False, {"points": 900}, "", 60), "b-dirty")
+    assert [*figures.table((proof, other))][2:] == [
+        "| `sample` | 3,500 points | 2,000 max exhaustive points, 8 looks | 2 | 1 | 2.0 "
+        "| a, b-dirty |",
+        "| `other` | 0 points | none | 0 | 0 | 0.0 | no tree |",
+        "", "3.0 minutes of proofs in all, 1 failed starts."]
 
 
 def test_figures_of_the_older_form_are_refused(tmp_path: Path) -> None:
@@ -90,15 +121,60 @@ def test_figures_of_the_older_form_are_refused(tmp_path: Path) -> None:
 
 def test_the_proof_furthest_from_its_aim_is_next_and_each_start_has_its_own_seed(
         runner: ModuleType, figures: Figures, tmp_path: Path) -> None:
-    text = ("with open('%s', 'a') as out: print(told.seed, file=out)\n" % (tmp_path / "seeds")
-            + "time.sleep(0.05); count(points=told.amount, failures=0)")
-    near, far = proof_of(text, 2, "near", 10), proof_of(text, 2, "far", 40)
+    def counts_as(name: str) -> str:
+        return (f"with open('{tmp_path / 'starts'}', 'a') as out: print('{name}', told.seed, file=out)\n"
+                "time.sleep(0.05); count(points=told.amount, failures=0)")
+    near, far = (proof_of(counts_as(name), 2, name, aim) for name, aim in (("near", 10), ("far", 40)))
     while figures.done(far) < far.aim:
-        runner.work([near, far], 0.001, figures)
-    assert figures.done(near) <= 20
-    seeds = (tmp_path / "seeds").read_text().split()
-    assert sorted(seeds[:5], key=int) == ["2", "2", "3", "4", "5"]
+        runner.work([near, far], 0.1, figures)
+    starts = (tmp_path / "starts").read_text().splitlines()
+    assert sorted(starts[:5]) == ["far 2", "far 3", "far 4", "far 5", "near 2"]
     assert Figures(tmp_path).done(far) >= 40
+
+
+def test_nothing_is_begun_that_would_not_end_in_time(
+        runner: ModuleType, figures: Figures, capsys: pytest.CaptureFixture[str]) -> None:
+    text = "time.sleep(0.05); count(points=told.amount, failures=0)"
+    short, long = proof_of(text, name="short", aim=1000), proof_of(text, name="long", pace=0.5)
+    started = time.monotonic()
+    runner.work([short, long], 0.05, figures)
+    assert time.monotonic() - started < 30
+    assert figures.done(long) == 0 and figures.done(short) > 0
+    assert "long is left out: one start takes about 0.1 minutes" in capsys.readouterr().out
+    runner.work([long], 0.1, figures)
+    assert figures.done(long) >= 10
+
+
+@pytest.mark.parametrize(("longest_wait", "is_first"), [(1, True), (600, False)])
+def test_no_core_idles_beside_a_long_start(
+        runner: ModuleType, figures: Figures, tmp_path: Path, monkeypatch: pytest.MonkeyPatch,
+        longest_wait: int, is_first: bool) -> None:
+    monkeypatch.setattr(runner, "LONGEST_WAIT", longest_wait)
+
+    def ends_as(name: str, seconds: float) -> str:
+        return (f"time.sleep({seconds}); count(points=told.amount, failures=0)\n"
+                f"with open('{tmp_path / 'ends'}', 'a') as out: print('{name}', file=out)\n")
+    long = proof_of(ends_as("long", 3), name="long", pace=0.8)
+    wide = proof_of(ends_as("wide", 0), 2, "wide")
+    small = proof_of(ends_as("small", 0), name="small")
+    runner.work([long, wide, small], 9 / 60, figures)
+    ends = (tmp_path / "ends").read_text().splitlines()
+    assert (ends[0] == "small") == is_first
+    assert "wide" in ends
+
+
+def test_how_long_a_start_takes_is_what_the_slowest_took(
+        runner: ModuleType, figures: Figures) -> None:
+    proof = proof_of("count(points=told.amount, failures=0)", pace=1000)
+    assert figures.seconds_of(proof, 10) == 10_000
+    figures.add(proof, 10, 2, Outcome(True, {"points": 10}, "", 1), "a")
+    figures.add(proof, 10, 3, Outcome(True, {"points": 10}, "", 3), "a")
+    figures.add(proof, 10, 4, Outcome(False, {"points": 10}, "", 99), "a")
+    assert figures.seconds_of(proof, 20) == 6
+    runner.work([proof], 2.9 / 60, figures)
+    assert figures.done(proof) == 20
+    runner.work([proof], 3.5 / 60, figures)
+    assert figures.done(proof) >= 30
 
 
 @pytest.mark.parametrize("text", [
@@ -127,7 +203,7 @@ def test_a_tree_that_changed_since_it_was_built_is_told(
     monkeypatch.setattr(runner, "state_of_tree", lambda: next(states, "a-dirty"))
     proof = proof_of("time.sleep(0.05); count(points=told.amount, failures=0)", aim=20)
     while figures.done(proof) < 20:
-        runner.work([proof], 0.02, figures)
+        runner.work([proof], 0.1, figures)
     trees = list(figures.trees(proof))
     assert trees[:2] == ["a", "a changed to a-dirty"]
     assert "a changed to a-dirty (changes in no commit): " in details(figures, proof)

@@ -34,6 +34,18 @@ def test_a_proof_that_failed_or_counted_too_little_has_not_passed(text: str) -> 
     assert not proofs.run(proof_of(text), 7, 3).passed
 
 
+@pytest.mark.parametrize(("counted", "is_enough"), [(2_700, False), (2_999, False), (3_000, True)])
+def test_what_can_be_counted_out_is_whole(counted: int, is_enough: bool) -> None:
+    proof = proof_of(f"count(points={counted}, failures=0)")
+    assert proofs.run(proof, 3_000, 1).passed == is_enough
+
+
+@pytest.mark.parametrize(("counted", "is_enough"), [(53, False), (54, True), (61, True)])
+def test_seconds_may_miss_a_little(counted: int, is_enough: bool) -> None:
+    proof = proof_of(f"count(seconds={counted}, failures=0)", unit="seconds")
+    assert proofs.run(proof, 60, 1).passed == is_enough
+
+
 def test_what_a_proof_printed_is_kept() -> None:
     outcome = proofs.run(proof_of("print('seen'); print('also', file=sys.stderr); sys.exit(3)"), 1, 1)
     assert "seen" in outcome.output and "also" in outcome.output
@@ -44,14 +56,41 @@ def test_every_row_names_a_program_of_the_tree_or_of_its_build() -> None:
     for proof in proofs.PROOFS:
         program = proof.command[0]
         assert program.startswith("build") or (proofs.TREE / program).exists(), program
-        assert 0 < proof.gate and 0 < proof.step and 0 < proof.aim <= proof.full, proof.name
+        assert bool(proof.step) == bool(proof.aim) and proof.aim <= proof.full, proof.name
+        assert proof.gate > 0 or proof.aim > 0, proof.name
+
+
+def test_every_row_is_in_the_gate_and_in_a_long_run_by_itself_or_by_its_family() -> None:
+    families = {proof.family for proof in proofs.PROOFS}
+    assert {proof.family for proof in proofs.of_gate()} == families
+    assert {proof.family for proof in proofs.of_long_run()} == families
+    assert len({proof.name for proof in proofs.PROOFS}) == len(proofs.PROOFS)
+
+
+def test_a_family_stands_for_its_rows_and_a_row_for_itself() -> None:
+    targets = [f"fuzzing:{target}" for target in proofs.TARGETS]
+    assert len(targets) >= 12
+    assert [proof.name for proof in proofs.of_long_run(["fuzzing"])] == targets
+    assert [proof.name for proof in proofs.of_long_run(["fuzzing:load"])] == ["fuzzing:load"]
+    [gate] = proofs.of_gate(["fuzzing"])
+    assert gate.unit == "seconds" and "--of=seconds" in gate.command
+    with pytest.raises(SystemExit, match="no such proof: fuzzing:load"):
+        proofs.of_gate(["fuzzing:load"])
+    with pytest.raises(SystemExit, match="no such proof: fuzz"):
+        proofs.of_long_run(["fuzz"])
+
+
+def test_a_long_run_soaks_in_whole_and_takes_small_steps_of_all_else() -> None:
+    for proof in proofs.of_long_run():
+        minutes = proof.step * proof.pace / 60
+        assert minutes > 30 if proof.name == "soak" else minutes < 7, proof.name
 
 
 def test_every_row_waits_long_enough_and_not_for_ever() -> None:
     for proof in proofs.PROOFS:
-        assert 600 < proof.limit(proof.gate) <= 8 * 3600, proof.name
-        if proof.unit == "seconds":
-            assert proof.limit(proof.step) > 2 * proof.step, proof.name
+        assert 600 < proof.limit(proof.gate or proof.step) <= 8 * 3600, proof.name
+        for amount in (proof.gate, proof.step):
+            assert proof.limit(amount) > 2 * proof.pace * amount, proof.name
     assert proof_of("").limit(1000) == 70
 
 
@@ -131,7 +170,7 @@ def test_lanes_start_nothing_when_nothing_is_chosen() -> None:
 
 def test_a_proof_that_cannot_start_has_failed_and_a_broken_report_is_told() -> None:
     outcomes = []
-    missing = Proof("missing", ("/nonexistent/program",), "points", 1, 1, 1, 1, 1)
+    missing = Proof("missing", ("/nonexistent/program",), "points", pace=1, patience=1)
     with Lanes(lambda proof, outcome: outcomes.append(outcome)) as lanes:
         lanes.start(lambda running: (missing, 1, 1))
     assert [outcome.passed for outcome in outcomes] == [False]

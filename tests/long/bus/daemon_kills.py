@@ -76,7 +76,7 @@ def test_kill_at_every_boundary(killed: KilledService, watch: TemporaryWatch, am
         leftovers = kills.strike(point)
         left.setdefault(point.change, set()).update(leftovers)
         figures["points"] += 1
-        figures["boundary_points"] += 1
+        figures["max_exhaustive_points"] += 1
     assert points
     figures["max_boundary_points"] = len(all_points)
     for change, lines in left.items():
@@ -90,7 +90,7 @@ def test_kill_at_random(killed: KilledService, watch: TemporaryWatch, amount: in
                         chance: random.Random, figures: Counter[str]) -> None:
     load = KillLoad(killed, chance, figures)
     try:
-        wanted = amount - figures["boundary_points"]
+        wanted = amount - figures["max_exhaustive_points"]
         while (kills := figures["random_kills"]) < wanted or (
                 not figures["kills_between_files"] and kills < MOST_KILLS_UNTIL_BETWEEN_FILES):
             if kills % KILLS_BETWEEN_FRESH == 0:

@@ -16,7 +16,7 @@ int main(int count, char **words) {
     proof_report report("failing_calls");
     fail_every_account_call(&report, options.amount);
     fail_every_store_call(&report, place.folder(), options.amount);
-    report.count("exhaustive_faults", report.figure("faults"));
+    report.count("max_exhaustive_faults", report.figure("faults"));
     fail_random_account_calls(&report, options.amount, options.seed);
     if (const std::string call = unknown_call(); !call.empty())
         report.fail("a call was made that the proof does not know: " + call);

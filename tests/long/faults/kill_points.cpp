@@ -18,7 +18,7 @@ int main(int count, char **words) {
     proof_report report("kill_points");
     kill_every_account_operation(&report, options.amount);
     kill_every_store_operation(&report, place.folder(), options.amount);
-    report.count("exhaustive_points", report.figure("points"));
+    report.count("max_exhaustive_points", report.figure("points"));
     kill_random_account_operations(&report, options.amount, options.seed);
     if (!outside_is_untouched())
         report.fail("what a link led to was written");

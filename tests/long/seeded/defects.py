@@ -34,5 +34,5 @@ DEFECTS = (
     Defect("ignored-read-error.patch", FAILING),
     Defect("missing-utf8-check.patch", Start("fuzzing", 5, ("--target", "tool_arguments"))),
     Defect("forgotten-authorization.patch",
-           Start("authorization_matrix", 368, ("-k", "test_refused"))),
+           Start("authorization_matrix", 46, ("-k", "test_refused"))),
 )

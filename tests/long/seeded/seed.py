@@ -21,7 +21,7 @@ def apply(defect: Defect, *options: str) -> None:
 
 
 def run(start: Start, seed: int) -> proofs.Outcome:
-    [proof] = proofs.named([start.proof])
+    [proof] = proofs.of_gate([start.proof])
     proofs.build([proof])
     started = dataclasses.replace(proof, command=(*proof.command, *start.words))
     return proofs.run(started, start.amount, seed)
@@ -63,7 +63,8 @@ def main() -> int:
              for start in dict.fromkeys(defect.noticed_by for defect in defects)}
     verdicts = [sound[defect.noticed_by] and is_caught(defect, options.seed) for defect in defects]
     options.figures.write_text(json.dumps(
-        {"defects": len(verdicts), "failures": verdicts.count(False)}) + "\n")
+        {"defects": len(verdicts), "max_exhaustive_defects": len(verdicts),
+         "failures": verdicts.count(False)}) + "\n")
     return 0 if verdicts and all(verdicts) else 1
 
 
