@@ -72,8 +72,8 @@ class Outcome:
     seconds: float
 
 
-def on_bus(name: str, build: str = "build") -> tuple[str, ...]:
-    return ("tests/long/on_bus", f"--build={build}", name)
+def on_bus(name: str, build: str = "build", *options: str) -> tuple[str, ...]:
+    return ("tests/long/on_bus", f"--build={build}", *options, name)
 
 
 def fuzzing(target: str) -> Proof:
@@ -116,7 +116,10 @@ PROOFS: tuple[Proof, ...] = (
     Proof("soak", on_bus("soak"), SECONDS,
           gate=60, step=1_800, aim=1_800, full=28_800, pace=1.05, patience=3),
     Proof("flood", on_bus("flood"), SECONDS,
-          gate=10, step=20, aim=60, full=600, pace=13, patience=60, cores=2),
+          gate=10, step=20, aim=60, full=600, pace=16, patience=60, cores=2),
+    Proof("flood_limited", on_bus("flood_limited", "build",
+                                  "--bus=data/examples/privane-bus-limits.conf"), SECONDS,
+          gate=10, step=20, aim=60, full=600, pace=8, patience=60, cores=2),
     Proof("daemon_secrets", on_bus("daemon_secrets"), "calls",
           gate=400, step=2_000, aim=2_000, full=20_000, pace=0.03, patience=3),
     Proof("seeded_defects", ("tests/long/seeded/run",), "defects",

@@ -4,10 +4,13 @@
 
 LARGEST is the most that the bus takes in a message; it throws out who sends more.
 Prints a line when its connections stand, waits for a line, then floods until its standard input
-ends, and prints as JSON what it did. It writes prebuilt bytes to raw sockets and reads no more than
-it must: whoever means harm does not wait for answers.
+ends, and prints as JSON what came of it: the "messages" it began to send, those that the service
+"answered" and those that the bus "denied", those "stalled" in the bus, and how often it was
+"thrown_out". It writes prebuilt bytes to raw sockets. Most kinds read nothing until the end, and then no more than it takes to see
+that they arrived: whoever means harm does not wait for answers.
 """
 import array
+import errno
 import json
 import os
 import random
@@ -15,18 +18,23 @@ import select
 import socket
 import struct
 import sys
+import time
 from collections import Counter
 from typing import Callable
 
 from gi.repository import Gio, GLib
 
-from harness.bus import INTERFACE, NAME, PATH
+from harness.bus import ACCESS_DENIED, INTERFACE, NAME, PATH
 from harness.sandbox import SYSTEM_BUS
-from harness.wire import NO_CAPABILITIES
+from harness.wire import FIXED_HEADER, NO_CAPABILITIES
 
 CONNECTIONS = 8
+# Fewer where more would be under way at once: with many, hardly a message would get through.
+UNDER_WAY = 32 << 20
 STALLED_CONNECTIONS = 40
 MEBIBYTE = 1 << 20
+# More than the kernel keeps of what is sent and not read.
+SOCKET = MEBIBYTE // 4
 # Of a message without its arguments, at most.
 HEAD = 1024
 LARGE = 16 * MEBIBYTE
@@ -34,14 +42,22 @@ LARGE = 16 * MEBIBYTE
 TEXT_SIZE = 8
 # Of a byte as a variant in a list: the length and the text of its type, and itself.
 VARIANT = b"\x01y\x00\x07"
-# How the service refuses arguments that are too large, service/intake.cpp.
-TOO_LARGE = b"The arguments of the call are too large"
-# Of a message: where its flags, the length of its body and its number stand.
+# Of a message: where its type, its flags, the length of its body and its number stand.
+TYPE_OFFSET = 1
 FLAGS_OFFSET = 2
 BODY_LENGTH_OFFSET = 4
 SERIAL_OFFSET = 8
 NO_REPLY_EXPECTED = 1
+ANSWERS = {Gio.DBusMessageType.METHOD_RETURN, Gio.DBusMessageType.ERROR}
+# The header's field for the sender, of what the bus itself says.
+FROM_BUS = b"\x07\x01s\0\x14\0\0\0org.freedesktop.DBus\0"
 DESCRIPTORS = 16
+# So many answers tell that messages of a kind arrive, small ones and large.
+MANY, FEW = 10, 1
+HEARING_SECONDS = 30.0
+# One in so many of a storm's connections waits so long for its answer.
+WAITING = 16
+ANSWER_SECONDS = 2.0
 
 done: Counter[str] = Counter()
 
@@ -62,11 +78,11 @@ class Connection:
         self.socket.sendall(b"BEGIN\r\n" + call("Hello", None, destination="org.freedesktop.DBus",
                                                 path="/org/freedesktop/DBus",
                                                 interface="org.freedesktop.DBus"))
-        assert self.socket.recv(1)
+        assert self.socket.recv(1, socket.MSG_PEEK)
         self.serial = 1
         self.socket.setblocking(False)
         self.rest = memoryview(b"")
-        self.answers = b""
+        self.unread = bytearray()
 
     def number(self, blob: bytes) -> bytearray:
         """The message with the connection's next number."""
@@ -87,15 +103,38 @@ class Connection:
             pass
         return is_new
 
-    def drain(self) -> None:
-        """Reads what is there, and counts the calls that the service found too large."""
+    def hear(self) -> bool:
+        """Counts answers that are there; False without any. Raises ConnectionError where the bus
+        has hung up."""
         try:
-            while got := self.socket.recv(MEBIBYTE):
-                self.answers += got
-                done["found_too_large"] += self.answers.count(TOO_LARGE)
-                self.answers = self.answers.rpartition(TOO_LARGE)[2][1 - len(TOO_LARGE):]
+            got = self.socket.recv(MEBIBYTE)
         except BlockingIOError:
-            pass
+            return False
+        if not got:
+            raise ConnectionResetError
+        self.unread += got
+        self._count_answers()
+        return True
+
+    def _count_answers(self) -> None:
+        begin = 0
+        while len(self.unread) >= begin + FIXED_HEADER:
+            body, _, fields = struct.unpack_from("<III", self.unread, begin + BODY_LENGTH_OFFSET)
+            end = begin + FIXED_HEADER + (fields + 7) // 8 * 8 + body
+            if len(self.unread) < end:
+                break
+            count_answer(bytes(self.unread[begin:end]))
+            begin = end
+        del self.unread[:begin]
+
+
+def count_answer(message: bytes) -> None:
+    if message[TYPE_OFFSET] not in ANSWERS:
+        return
+    if FROM_BUS not in message:
+        done["answered"] += 1
+    elif ACCESS_DENIED.encode() in message:
+        done["denied"] += 1
 
 
 def finished(seconds: float = 0) -> bool:
@@ -147,9 +186,21 @@ def large_answer(size: int) -> bytes:
     return addressed(message, size)
 
 
+def hear_out(connections: list[Connection], least: int) -> None:
+    """Sends nothing more and waits for answers."""
+    end = time.monotonic() + HEARING_SECONDS
+    while True:
+        for connection in connections:
+            connection.hear()
+        if done["answered"] + done["denied"] >= least or time.monotonic() > end:
+            return
+        select.select(connections_of(connections), [], [], 0.05)
+
+
 def flood_with(blobs: list[bytes], chance: random.Random, is_reading: bool = False) -> None:
     """As fast as the bus takes it, on all connections in turn."""
-    connections = [Connection() for _ in range(CONNECTIONS)]
+    largest = max(map(len, blobs))
+    connections = [Connection() for _ in range(min(CONNECTIONS, UNDER_WAY // largest + 1))]
     start()
     while not finished():
         _, writable, _ = select.select([], connections_of(connections), [], 0.05)
@@ -160,8 +211,14 @@ def flood_with(blobs: list[bytes], chance: random.Random, is_reading: bool = Fal
                 if not connection.push(chance.choice(blobs)):
                     break
                 done["messages"] += 1
-            if is_reading:
-                connection.drain()
+            while is_reading and connection.hear():
+                pass
+    hear_out(connections, least_answers(largest))
+
+
+def least_answers(size: int) -> int:
+    """How many must come, of messages of that size."""
+    return MANY if size < MEBIBYTE // 2 else FEW
 
 
 def connections_of(connections: list[Connection]) -> list[socket.socket]:
@@ -205,14 +262,32 @@ def large_others(chance: random.Random, largest: int) -> None:
     flood_with([large_signal(large(largest)), large_answer(large(largest))], chance)
 
 
+def too_large(_: random.Random, largest: int) -> None:
+    """Messages that the bus does not take, each on a connection of its own."""
+    blob = text_call(max(LARGE, largest))
+    start()
+    while not finished():
+        connection = Connection()
+        done["messages"] += 1
+        try:
+            connection.push(blob)
+            while not finished(0.001):
+                connection.push(b"")
+                connection.hear()
+        except ConnectionError:
+            done["thrown_out"] += 1
+        connection.socket.close()
+
+
 def lists(chance: random.Random, largest: int) -> None:
     """Lists that just fit, and larger ones."""
-    larger = min(250_000, large(largest) // TEXT_SIZE)
-    flood_with([silent(list_call(size)) for size in (30_000, 30_000, 30_000, larger)], chance)
+    fitting = list_call(30_000)
+    larger = list_call(min(250_000, large(largest) // TEXT_SIZE))
+    flood_with([silent(fitting), silent(fitting), fitting, larger], chance)
 
 
 def largest_list(kind: str, elements: bytes) -> bytes:
-    """A call with one list of that kind of elements, as large as the bus takes."""
+    """A call with one list of that kind of elements."""
     head = bytearray(call("Pinsrv", GLib.Variant(f"({kind})", ([],))))
     body = struct.pack("<I", len(elements)) + elements
     struct.pack_into("<I", head, BODY_LENGTH_OFFSET, len(body))
@@ -226,15 +301,15 @@ def flood_with_largest_lists(blob: bytes, chance: random.Random) -> None:
 
 
 def text_lists(chance: random.Random, largest: int) -> None:
-    """Lists of the shortest texts, as long as a message can be."""
+    """Lists of the shortest texts, as long as a large message can be."""
     # Without the padding of the last one.
-    elements = bytes((largest - HEAD) // TEXT_SIZE * TEXT_SIZE - 3)
+    elements = bytes(large(largest) // TEXT_SIZE * TEXT_SIZE - 3)
     flood_with_largest_lists(largest_list("as", elements), chance)
 
 
 def variant_lists(chance: random.Random, largest: int) -> None:
-    """Lists of the elements that cost the receiver most, as long as a message can be."""
-    elements = VARIANT * ((largest - HEAD) // len(VARIANT))
+    """Lists of the elements that cost the receiver most, as long as a large message can be."""
+    elements = VARIANT * (large(largest) // len(VARIANT))
     flood_with_largest_lists(largest_list("av", elements), chance)
 
 
@@ -256,8 +331,11 @@ def descriptors(chance: random.Random, _: int) -> None:
                     [connection.number(chance.choice(blobs))],
                     [(socket.SOL_SOCKET, socket.SCM_RIGHTS, array.array("i", handles))])
                 done["messages"] += 1
-            except (BlockingIOError, OSError):
-                done["blocked"] += 1
+            except OSError as error:
+                # No room, or more descriptors under way than the kernel lets a user have.
+                if error.errno not in (errno.EAGAIN, errno.ETOOMANYREFS):
+                    raise
+    hear_out(connections, MANY)
 
 
 def stalled(_: random.Random, largest: int) -> None:
@@ -272,35 +350,43 @@ def stalled(_: random.Random, largest: int) -> None:
         for connection in connections:
             if connection.rest:
                 connection.push(b"")
+    for connection in connections:
+        connection.hear()
+        # More than a socket holds: the bus has read of it.
+        done["stalled"] += len(connection.rest) < len(blob) - SOCKET
 
 
 def storm(chance: random.Random, _: int) -> None:
-    """Connections that come, call once, and go."""
+    """Connections that come, call once, and go; few wait for the answer."""
     blob = text_call(8)
     start()
     while not finished():
-        try:
-            connection = Connection()
-        except OSError:
-            done["blocked"] += 1
-            continue
+        connection = Connection()
         connection.push(blob)
-        if chance.random() < 0.5:
-            connection.drain()
-        connection.socket.close()
         done["messages"] += 1
+        if chance.random() < 1 / WAITING:
+            wait_for_answer(connection)
+        connection.socket.close()
+
+
+def wait_for_answer(connection: Connection) -> None:
+    end = time.monotonic() + ANSWER_SECONDS
+    before = done.total()
+    while done.total() == before and time.monotonic() < end and not finished():
+        if select.select([connection.socket], [], [], 0.05)[0]:
+            connection.hear()
 
 
 KINDS: dict[str, Callable[[random.Random, int], None]] = {
-    kind.__name__: kind for kind in (calls, read_calls, questions, large_calls, large_others, lists,
-                                     text_lists, variant_lists, descriptors, stalled, storm)}
+    kind.__name__: kind for kind in (calls, read_calls, questions, large_calls, large_others,
+                                     too_large, lists, text_lists, variant_lists, descriptors,
+                                     stalled, storm)}
 
 
 def main() -> None:
     try:
         KINDS[sys.argv[1]](random.Random(sys.argv[2]), int(sys.argv[3]))
-    except (ConnectionError, BrokenPipeError):
-        # The bus threw us out.
+    except ConnectionError:
         done["thrown_out"] += 1
     print(json.dumps(done), flush=True)
 
