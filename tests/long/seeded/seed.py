@@ -5,6 +5,7 @@ Started by tests/long/seeded/run, on the view of the tree that may be broken.
 import argparse
 import dataclasses
 import json
+import re
 import subprocess
 import sys
 from pathlib import Path
@@ -34,20 +35,28 @@ def passes_undamaged(start: Start, seed: int) -> bool:
     return outcome.passed
 
 
+def why_unnoticed(defect: Defect, outcome: proofs.Outcome) -> str:
+    """Empty where the proof ran, and told of the very thing that is wrong."""
+    if outcome.passed or outcome.counts.get("failures", 0) == 0:
+        return "went unnoticed"
+    if not re.search(defect.shown, outcome.output, re.MULTILINE):
+        return f"made the proof fail for something else than {defect.shown!r}"
+    return ""
+
+
 def is_caught(defect: Defect, seed: int) -> bool:
-    """Whether the proof says that something is wrong: that it ran, and what failed."""
     apply(defect)
     try:
         outcome = run(defect.noticed_by, seed)
     finally:
         apply(defect, "--reverse")
-    failures = outcome.counts.get("failures", 0)
-    if failures == 0:
-        print(f"{defect.patch} went unnoticed:\n{outcome.output[-4000:]}")
+    why = why_unnoticed(defect, outcome)
+    if why:
+        print(f"{defect.patch} {why}:\n{outcome.output[-4000:]}")
     else:
-        print(f"{defect.patch}: {defect.noticed_by.proof} noticed, {failures:,} failures, "
-              f"{outcome.seconds:.0f} s", flush=True)
-    return failures > 0 and not outcome.passed
+        print(f"{defect.patch}: {defect.noticed_by.proof} noticed, "
+              f"{outcome.counts['failures']:,} failures, {outcome.seconds:.0f} s", flush=True)
+    return not why
 
 
 def main() -> int:
