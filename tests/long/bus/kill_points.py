@@ -99,9 +99,13 @@ class Tracer:
 
     def end(self) -> list[str]:
         """The names of the calls, of a service that is still there or not."""
+        return [match[1] for match in map(CALL.match, self.end_with_lines()) if match]
+
+    def end_with_lines(self) -> list[str]:
+        """What strace printed of them."""
         self._tracer.terminate()
         self._tracer.communicate(timeout=5)
-        return [match[1] for match in map(CALL.match, TRACE.read_text().splitlines()) if match]
+        return TRACE.read_text().splitlines()
 
 
 class KillPoints:

@@ -180,6 +180,27 @@ account_outcome outcome_of(const operation &what, const call_trace &trace, int i
     return outcome;
 }
 
+account_outcome outcome_on_bad_disk(const operation &what, const call_trace &trace, int index,
+                                    int error) {
+    account_outcome outcome = outcome_of(what, trace, index, {error, 0, false});
+    if (std::strcmp(trace.calls[index].path, ACCOUNT_FOLDER) != 0)
+        return outcome;
+    // The folder could not be synced, which stops nothing, and then the next file not be renamed.
+    for (int i = index + 1; i < trace.count; i++) {
+        const trapped_call &call = trace.calls[i];
+        if (std::strcmp(call.name, "rename") != 0)
+            continue;
+        const account_outcome renaming =
+            of_temporary(what, call, 1, cause_of({error, 0, false}), false);
+        const std::string one = "corefile 101: " + beginning(what, 1);
+        outcome.error = "corefile 103: " + beginning(what, 2) + renaming.error.substr(one.size()) +
+                        "\n" + outcome.error.substr(one.size());
+        outcome.replaced = renaming.replaced;
+        return outcome;
+    }
+    return outcome;
+}
+
 // A failure to read one file, as its error says it; "" for a call whose failure does not matter.
 static std::string failed_read(const trapped_call &call) {
     const std::string name = core_file_table[row_of(call.path)].name;

@@ -26,6 +26,10 @@ struct account_outcome {
 account_outcome outcome_of(const operation &what, const call_trace &trace, int index,
                            const call_fault &fault);
 
+// Likewise, from that call on everything fails that writes on the disk.
+account_outcome outcome_on_bad_disk(const operation &what, const call_trace &trace, int index,
+                                    int error);
+
 // Of an opening of the database: its error and its log.
 account_outcome outcome_of_open(const call_trace &trace, int index, const call_fault &fault);
 

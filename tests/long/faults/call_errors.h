@@ -12,7 +12,13 @@ struct call_fault {
     bool for_ever;
 };
 
+// A call that nobody has listed the errors of makes a proof fail.
+bool has_errors(const trapped_call &call);
+
 // All that apply to the call. An interruption ends some time, so it comes once.
 std::vector<call_fault> faults_of(const trapped_call &call);
+
+// One of these, as a plan chooses it: for trap_plan::choose.
+bool choose_fault(const trapped_call &call, unsigned choice, trap_plan *plan);
 
 std::string shown(const call_fault &fault);

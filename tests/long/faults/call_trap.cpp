@@ -43,13 +43,13 @@ struct unknown_calls {
 };
 static unknown_calls *unknown;
 
-static void *shared_memory(std::size_t size) {
+void *make_shared_memory(std::size_t size) {
     void *memory = mmap(nullptr, size, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
     return memory != MAP_FAILED ? memory : nullptr;
 }
 
 call_trace *make_shared_trace() {
-    return static_cast<call_trace *>(shared_memory(sizeof(call_trace)));
+    return static_cast<call_trace *>(make_shared_memory(sizeof(call_trace)));
 }
 
 static bool is_labelled(long fd) {
@@ -78,10 +78,54 @@ static bool is_left_out(const trapped_call &call) {
     return std::strncmp(call.path, "/usr/", 5) == 0 || std::strncmp(call.path, "/proc/", 6) == 0;
 }
 
+static bool is_one_of(const char *name, std::span<const char *const> names) {
+    return std::any_of(names.begin(), names.end(),
+                       [name](const char *one) { return std::strcmp(one, name) == 0; });
+}
+
+static long open_flags(const known_call *row, const long *arguments) {
+    if (std::strcmp(row->name, "open") != 0)
+        return 0;
+    if (row->first == takes::FOLDER_AND_PATH)
+        return arguments[2];
+#ifdef SYS_creat
+    if (row->number == SYS_creat)
+        return O_WRONLY | O_CREAT | O_TRUNC;
+#endif
+    return arguments[1];
+}
+
+static long make_call(long number, const long *arguments) {
+    const long result = syscall(number, arguments[0], arguments[1], arguments[2], arguments[3],
+                                arguments[4], OWN_CALL);
+    return result >= 0 ? result : -errno;
+}
+
+// Whether an open would make its file.
+static bool makes_file(const known_call *row, const long *arguments, long flags) {
+    if ((flags & O_CREAT) == 0)
+        return false;
+    const bool in_folder = row->first == takes::FOLDER_AND_PATH;
+    const long asked[] = {in_folder ? arguments[0] : AT_FDCWD, arguments[in_folder ? 1 : 0], F_OK,
+                          0, 0};
+    return make_call(SYS_faccessat, asked) != 0;
+}
+
+static void describe_effect(const known_call *row, const long *arguments, trapped_call *call) {
+    static constexpr const char *writing[] = {"write",  "fsync",  "rename",  "unlink",
+                                              "rmdir",  "mkdir",  "chmod",   "chown",
+                                              "fchmod", "fchown", "truncate"};
+    const long flags = open_flags(row, arguments);
+    call->writes = is_one_of(call->name, writing) || (flags & O_TRUNC) != 0 ||
+                   makes_file(row, arguments, flags);
+    call->may_write = call->writes || (flags & O_ACCMODE) != O_RDONLY;
+}
+
 // False for a call on something that was opened before the trap began.
 static bool describe(const known_call *row, const long *arguments, trapped_call *call) {
     *call = {};
     (void)std::snprintf(call->name, sizeof call->name, "%s", row->name);
+    describe_effect(row, arguments, call);
     if (row->first == takes::PATH) {
         take_path(call->path, reinterpret_cast<const char *>(arguments[0]));
         return true;
@@ -101,12 +145,6 @@ static bool describe(const known_call *row, const long *arguments, trapped_call 
     return true;
 }
 
-static long make_call(long number, const long *arguments) {
-    const long result = syscall(number, arguments[0], arguments[1], arguments[2], arguments[3],
-                                arguments[4], OWN_CALL);
-    return result >= 0 ? result : -errno;
-}
-
 [[noreturn]] static void die() {
     (void)syscall(SYS_kill, syscall(SYS_getpid), SIGKILL);
     _exit(99);
@@ -117,14 +155,27 @@ static bool is_on(const trapped_call &call, const char *name, const char *path) 
            std::strcmp(call.path, path) == 0;
 }
 
+static void note_strike(int index) {
+    if (!trace->struck)
+        trace->struck_at = index;
+    trace->struck = true;
+}
+
 // The error of this call, 0 for none. A short write is told by *out_short.
 static int planned_error(const trapped_call &call, int index, bool *out_short) {
     char line[sizeof failing_line];
     (void)std::snprintf(line, sizeof line, "%s %s", call.name, call.path);
     const bool fails_on = failing_line[0] != '\0' && std::strcmp(line, failing_line) == 0;
 
+    if (plan.disk_error != 0 && index >= plan.disk_fails_at &&
+        (call.writes || (plan.disk_error == EROFS && call.may_write))) {
+        note_strike(index);
+        return plan.disk_error;
+    }
+    if (index == plan.fail_at && plan.choose != nullptr && !plan.choose(call, plan.choice, &plan))
+        return 0;
     if (index == plan.fail_at) {
-        trace->struck = true;
+        note_strike(index);
         *out_short = plan.error == 0;
         if (plan.for_ever || plan.error_after_short != 0) {
             std::memcpy(failing_line, line, sizeof line);
@@ -187,9 +238,7 @@ static bool is_unknown(const known_call *row, const long *arguments) {
     if (row->number == SYS_fcntl)
         return arguments[1] == F_DUPFD || arguments[1] == F_DUPFD_CLOEXEC;
     return row->first == takes::DESCRIPTOR && arguments[0] > STDERR_FILENO &&
-           !is_labelled(arguments[0]) &&
-           std::any_of(std::begin(changes), std::end(changes),
-                       [row](const char *name) { return std::strcmp(name, row->name) == 0; });
+           !is_labelled(arguments[0]) && is_one_of(row->name, changes);
 }
 
 static long answer(long number, long *arguments) {
@@ -248,7 +297,7 @@ bool install_call_trap() {
     filter[4 + count] = BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW);
     const sock_fprog program = {static_cast<unsigned short>(count + 5), filter};
 
-    unknown = static_cast<unknown_calls *>(shared_memory(sizeof *unknown));
+    unknown = static_cast<unknown_calls *>(make_shared_memory(sizeof *unknown));
     struct sigaction action = {};
     action.sa_sigaction = on_trapped_call;
     action.sa_flags = SA_SIGINFO;
@@ -270,11 +319,16 @@ void begin_trap(call_trace *recorded, const trap_plan &wanted, const std::string
     plan = wanted;
     recorded->count = 0;
     recorded->struck = false;
+    recorded->struck_at = -1;
     trace = recorded;
 }
 
 void end_trap() {
     trace = nullptr;
+}
+
+const trap_plan &followed_plan() {
+    return plan;
 }
 
 std::string line_of(const trapped_call &call) {

@@ -2,6 +2,9 @@
 // calls fail.
 #include "tests/long/faults/fail_stores.h"
 
+#include <cerrno>
+
+#include "platform/digest_entry/digest_entry.h"
 #include "tests/long/faults/boot_files.h"
 #include "tests/long/faults/judgement.h"
 #include "tests/long/faults/store_cases.h"
@@ -13,10 +16,14 @@ class store_failer {
     store_failer(proof_report *report, std::string folder)
         : report_(report), folder_(std::move(folder)) {}
     void strike_all(const store_case &one, guint64 amount);
+    // The disk goes bad at each call that writes, stays so for the next try, and is mended.
+    void spoil_disk(const store_case &one, guint64 amount);
 
   private:
     bool rehearse();
     std::string strike(int index, const call_fault &fault);
+    std::string try_on_bad_disk(int from, int error, store_bytes *out_bytes);
+    std::string outlive_bad_disk(int index, int error);
     std::string judge_file(const store_outcome &expected);
     std::string judge_boot(const store_outcome &expected);
 
@@ -126,6 +133,10 @@ void store_failer::strike_all(const store_case &one, guint64 amount) {
     one_ = one;
     if (!rehearse())
         return;
+    for (int index = 0; index < rehearsal_->count; index++)
+        if (!has_errors(rehearsal_->calls[index]))
+            report_->fail(one_.name +
+                          ": nobody listed how a call fails: " + line_of(rehearsal_->calls[index]));
     for (int index = 0; index < rehearsal_->count; index++) {
         for (const call_fault &fault : faults_of(rehearsal_->calls[index])) {
             if (report_->figure("faults") >= amount || report_->is_hopeless())
@@ -142,8 +153,92 @@ void store_failer::strike_all(const store_case &one, guint64 amount) {
     }
 }
 
+// With the disk bad from a call on. What has to be there, of what was there before.
+std::string store_failer::try_on_bad_disk(int from, int error, store_bytes *out_bytes) {
+    trap_plan plan;
+    plan.disk_fails_at = from;
+    plan.disk_error = error;
+    begin_trap(last_, plan, folder_);
+    const store_answer answer = one_.run();
+    end_trap();
+    store_outcome expected = {false, answer_of_success(one_), store_bytes::NEW};
+    // The first call that fails with harm decides.
+    for (int i = 0; i < last_->count && expected.answer.number == 0; i++) {
+        if (!last_->struck || i < last_->struck_at || last_->calls[i].result != -error)
+            continue;
+        expected = outcome_of_store(one_, folder_, *last_, i, {error, 0, true});
+        // Nothing can be brought back to a bad disk.
+        if (one_.kind != store_kind::BOOT_BLOCK &&
+            expected.answer.number == DIGEST_ENTRY_ERROR_SYNC)
+            expected.bytes = store_bytes::NEW;
+        if (expected.unforeseen)
+            break;
+    }
+    *out_bytes = expected.bytes;
+    return expected.unforeseen ? "nobody thought of that call"
+                               : difference_of_answers(expected.answer, answer);
+}
+
+std::string store_failer::outlive_bad_disk(int index, int error) {
+    put_back_store(one_, one_.files);
+    const bool is_boot_block = one_.kind == store_kind::BOOT_BLOCK;
+    folder_state files = one_.files;
+    for (const char *turn : {"on the bad disk ", "the next try on the bad disk "}) {
+        store_bytes bytes = store_bytes::OLD;
+        std::string wrong = try_on_bad_disk(index, error, &bytes);
+        if (wrong.empty() && index > 0 && last_->struck_at != index)
+            wrong = "makes another call";
+        index = 0;
+        if (is_boot_block && bytes == store_bytes::NEW)
+            files = boot_files_after(files, "a", "new");
+        else if (!is_boot_block && bytes == store_bytes::NEW)
+            files = one_.after;
+        if (wrong.empty() && is_boot_block)
+            wrong = judge_boot_block(files);
+        else if (wrong.empty() &&
+                 text_of(look_at_store(one_), one_.file) != text_of(files, one_.file))
+            wrong = "leaves another file";
+        if (!wrong.empty())
+            return turn + wrong;
+    }
+    if (const std::string wrong = difference_of_answers(answer_of_success(one_), one_.run());
+        !wrong.empty())
+        return "on the mended disk " + wrong;
+    if (is_boot_block)
+        return judge_boot_block(boot_files_after(files, "a", "new"));
+    const folder_state now = look_at_store(one_);
+    return text_of(now, one_.file) == text_of(one_.after, one_.file)
+               ? ""
+               : "on the mended disk it ends in another file";
+}
+
+void store_failer::spoil_disk(const store_case &one, guint64 amount) {
+    static constexpr int errors[] = {EIO, ENOSPC, EDQUOT, EROFS};
+    one_ = one;
+    if (!rehearse())
+        return;
+    for (int index = 0; index < rehearsal_->count; index++) {
+        const trapped_call &call = rehearsal_->calls[index];
+        for (const int error : errors) {
+            if (!(call.writes || (error == EROFS && call.may_write)) ||
+                report_->figure("faults") >= amount || report_->is_hopeless())
+                continue;
+            const std::string wrong = outlive_bad_disk(index, error);
+            report_->count("faults");
+            report_->count("bad_disks");
+            report_->count("operations", 3);
+            if (!wrong.empty())
+                report_->fail(one.name + ", the disk bad from call " + std::to_string(index) +
+                              ", " + line_of(call) + ": " + shown({error, 0, true}) + ": " + wrong);
+        }
+    }
+}
+
 void fail_every_store_call(proof_report *report, const std::string &folder, guint64 amount) {
     store_failer failer(report, folder);
-    for (const store_case &one : store_cases(folder))
+    const std::vector<store_case> cases = store_cases(folder);
+    for (const store_case &one : cases)
+        failer.spoil_disk(one, amount);
+    for (const store_case &one : cases)
         failer.strike_all(one, amount);
 }

@@ -14,6 +14,7 @@ int main(int count, char **words) {
         return PROOF_CANNOT_RUN;
 
     proof_report report("failing_calls");
+    fail_accounts_on_bad_disk(&report, options.amount);
     fail_every_account_call(&report, options.amount);
     fail_every_store_call(&report, place.folder(), options.amount);
     report.count("max_exhaustive_faults", report.figure("faults"));
