@@ -232,6 +232,10 @@ file_result atomic_file::replace(std::string_view text, const file_access &of_ne
         !temporary.finish(exists_ ? access_ : of_new_file) || !temporary.rename_into_place())
         return file_result::NOT_WRITTEN;
 
+    return sync_folder();
+}
+
+file_result atomic_file::sync_folder() const {
     return fsync(folder_fd_) == 0 ? file_result::DONE : file_result::NOT_SYNCED;
 }
 

@@ -76,6 +76,9 @@ class atomic_file {
     // The old file's owner and mode are kept; a new file gets those given.
     file_result replace(std::string_view text, const file_access &of_new_file);
 
+    // Makes what the folder names last. DONE, or NOT_SYNCED.
+    file_result sync_folder() const;
+
     // After a replacement that was not synced: brings back the text that was read, or removes a new
     // file, as far as the disk lets.
     void take_back(std::string_view old_text);

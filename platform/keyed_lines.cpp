@@ -120,8 +120,9 @@ file_result keyed_lines_update(const char *path, const line_format &format,
         return result;
 
     keyed_lines_apply(old_text.view(), format, changes, &new_text);
+    // What stands there may be of a replacement that was not synced and could not be taken back.
     if (new_text.view() == old_text.view())
-        return file_result::DONE;
+        return file.sync_folder();
 
     if (!file.exists()) {
         gid_t folder_group = 0;

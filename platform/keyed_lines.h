@@ -36,6 +36,7 @@ void keyed_lines_apply(std::string_view text, const line_format &format,
                        std::span<const line_change> changes, wiped_text *out_text);
 
 // The same to a file, under its lock, in one replacement. A file that would stay as it is is not
-// written. Where the replacement could not be synced, the old text is brought back.
+// written, only its folder is synced. Where a replacement could not be synced, the old text is
+// brought back.
 file_result keyed_lines_update(const char *path, const line_format &format,
                                std::span<const line_change> changes);

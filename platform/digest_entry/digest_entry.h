@@ -19,7 +19,7 @@ extern "C" {
  * comments and everything else stay byte for byte where they are; a last line without a line end
  * gets one, and one that ends in a backslash, by which Apache would join the next one to it, is
  * followed by a line with a blank before a user is added. A file that would stay as it is is not
- * written.
+ * written, only made sure to last.
  *
  * The file is replaced as a whole or not at all, and keeps its owner, group and mode; a web server
  * that reads it meets the old or the new one. Where it is missing, it is made with mode 0640, of

@@ -19,7 +19,7 @@ extern "C" {
  * The file is replaced as a whole or not at all, and keeps its owner, group and mode; a reader
  * needs no lock and meets the old or the new one. Where it is missing, it is made with mode 0644,
  * of the caller and its folder's group, and so is its folder, with mode 0755 less the umask. A file
- * that would stay as it is is not written; one above 1 MiB is refused.
+ * that would stay as it is is not written, only made sure to last; one above 1 MiB is refused.
  *
  * Writers lock parameters.conf.lock, beside the file, with flock(2), and wait for each other for at
  * most 3 seconds. What changes the file without that lock may be lost.

@@ -34,6 +34,8 @@ class store_failer {
     store_case one_;
 };
 
+static constexpr const char *NOT_LASTING = "succeeded before the folder was synced";
+
 static std::string shown(const store_answer &answer) {
     std::string text = std::to_string(answer.number) + " '" + answer.error + "', logging";
     for (const std::string &line : answer.log)
@@ -121,6 +123,8 @@ std::string store_failer::strike(int index, const call_fault &fault) {
     if (expected.unforeseen)
         return "nobody thought of that call";
     std::string wrong = difference_of_answers(expected.answer, answer);
+    if (wrong.empty() && answer.number == 0 && !is_folder_synced(one_, folder_, *last_))
+        wrong = NOT_LASTING;
     if (wrong.empty())
         wrong = one_.kind == store_kind::BOOT_BLOCK ? judge_boot(expected) : judge_file(expected);
     if (answer.number == 0 && one_.kind == store_kind::BOOT_BLOCK)
@@ -175,8 +179,11 @@ std::string store_failer::try_on_bad_disk(int from, int error, store_bytes *out_
             break;
     }
     *out_bytes = expected.bytes;
-    return expected.unforeseen ? "nobody thought of that call"
-                               : difference_of_answers(expected.answer, answer);
+    if (expected.unforeseen)
+        return "nobody thought of that call";
+    if (answer.number == 0 && !is_folder_synced(one_, folder_, *last_))
+        return NOT_LASTING;
+    return difference_of_answers(expected.answer, answer);
 }
 
 std::string store_failer::outlive_bad_disk(int index, int error) {

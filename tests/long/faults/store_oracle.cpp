@@ -131,6 +131,15 @@ static std::string recorded(const std::string &path, const std::string &folder) 
     return path.starts_with(folder + "/") ? path.substr(folder.size() + 1) : path;
 }
 
+bool is_folder_synced(const store_case &one, const std::string &folder, const call_trace &trace) {
+    const std::string own = recorded(one.folder, folder);
+    bool synced = one.kind == store_kind::BOOT_BLOCK;
+    for (int i = 0; i < trace.count; i++)
+        synced = synced || (std::strcmp(trace.calls[i].name, "fsync") == 0 &&
+                            own == trace.calls[i].path && trace.calls[i].result == 0);
+    return synced;
+}
+
 store_answer answer_of_success(const store_case &one) {
     store_answer answer;
     if (one.kind == store_kind::ROOT_FLAG)

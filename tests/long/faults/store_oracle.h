@@ -20,5 +20,9 @@ struct store_outcome {
 store_outcome outcome_of_store(const store_case &one, const std::string &folder,
                                const call_trace &trace, int index, const call_fault &fault);
 
+// Whether the folder of the file was synced, as it has to be before success is told. The boot
+// block's copies are no new files.
+bool is_folder_synced(const store_case &one, const std::string &folder, const call_trace &trace);
+
 // Of an operation that nothing happens to.
 store_answer answer_of_success(const store_case &one);

@@ -143,6 +143,39 @@ TEST_F(DigestFile, NewFileThatIsNotSyncedGoes) {
     EXPECT_EQ(folder_.names(), (texts{"digest.lock"}));
 }
 
+// Such a disk may lose what it shows, so nobody is told yet that it is done.
+TEST_F(DigestFile, RepeatedChangeIsDoneWhenTheFolderIsSynced) {
+    const std::string sync = "fsync " + folder_.path().substr(folder_.path().rfind('/') + 1);
+    folder_.write("digest", BOB);
+    {
+        file_calls calls;
+        calls.fail(sync, EIO);
+        calls.before = [&](const std::string &line) {
+            if (line == sync)
+                calls.fail("renameat digest.tmp digest", EIO);  // nothing can be taken back
+        };
+        ASSERT_EQ(digest_file_set(path_.c_str(), "alice", "secret"), DIGEST_ENTRY_ERROR_SYNC);
+    }
+    ASSERT_EQ(folder_.read("digest"), BOB + ALICE);
+
+    file_calls calls;
+    calls.fail(sync, EIO);
+    EXPECT_EQ(digest_file_set(path_.c_str(), "alice", "secret"), DIGEST_ENTRY_ERROR_SYNC);
+    EXPECT_EQ(digest_file_set(path_.c_str(), "alice", "secret"), 0);
+    EXPECT_EQ(std::count(calls.lines().begin(), calls.lines().end(), sync), 2);
+    EXPECT_EQ(folder_.read("digest"), BOB + ALICE);
+}
+
+// A new file that was not synced, and was removed, may come back as well.
+TEST_F(DigestFile, RemovalFromAMissingFileIsDoneWhenTheFolderIsSynced) {
+    const std::string sync = "fsync " + folder_.path().substr(folder_.path().rfind('/') + 1);
+    file_calls calls;
+    calls.fail(sync, EIO);
+    EXPECT_EQ(digest_file_delete(path_.c_str(), "alice"), DIGEST_ENTRY_ERROR_SYNC);
+    EXPECT_EQ(digest_file_delete(path_.c_str(), "alice"), 0);
+    EXPECT_EQ(folder_.names(), (texts{"digest.lock"}));
+}
+
 TEST_F(DigestFile, FolderMustExist) {
     const std::string path = folder_.path("apache2/digest");
 
