@@ -51,9 +51,10 @@ class Seen:
     error_name: str | None
 
     def are_zeros(self) -> bool:
-        """What the service sends itself behind a password, to overwrite what it was read into."""
+        """What the service sends itself behind a password, to overwrite what it was read into; a
+        number is before them."""
         return (self.type == SIGNAL and self.member == "Zeros" and self.destination == self.sender
-                and len(self.arguments) == 1 and not any(self.arguments[0]))
+                and len(self.arguments) == 2 and not any(self.arguments[1]))
 
 
 def is_end_of(name: str | None) -> Callable[[Seen], bool]:
