@@ -110,7 +110,8 @@ class KillLoad:
         self._drain()
         try:
             interrupted = self._judge(history, calls, answers)
-            killed.recover(interrupted)
+            # Who takes their names or removes their groups would not be served as the model says.
+            killed.repair(killed.recover(interrupted))
         except AssertionError as error:
             raise AssertionError(f"calls {calls}, answers {answers}: {error}") from error
 

@@ -138,6 +138,14 @@ class KilledService:
             assert any(same_error(error, refusal) for refusal in REPEATED), (call, error)
         return history
 
+    def repair(self, history: History) -> None:
+        """Rids the groups of the users who are gone, as one is told to."""
+        for name in {name for names in history.ghosts().values() for name in names}:
+            self.make(history, ("AddUser", name, OLD, "users", "", ""))
+            self.make(history, ("RemoveUser", name))
+        assert not History(self.hashes).ghosts()
+        self._half_done.clear()
+
     def _check_warnings(self, history: History, cut_off: Call | None) -> None:
         """The start tells of all that is half done, and of nothing else; and what was not half done
         before is so by the call that was cut off."""
