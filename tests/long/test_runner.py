@@ -83,7 +83,7 @@ def test_a_family_stands_for_its_rows_and_a_row_for_itself() -> None:
 def test_a_long_run_soaks_in_whole_and_takes_small_steps_of_all_else() -> None:
     for proof in proofs.of_long_run():
         minutes = proof.step * proof.pace / 60
-        assert minutes > 30 if proof.name == "soak" else minutes < 7, proof.name
+        assert minutes > 30 if proof.name == "soak" else minutes < 12, proof.name
 
 
 def test_every_row_waits_long_enough_and_not_for_ever() -> None:

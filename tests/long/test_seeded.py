@@ -40,13 +40,13 @@ def reach(start: Start) -> int:
     if start.proof != TABLE:
         assert "-k" not in start.words, "of that proof nobody knows how much a test does"
         return start.amount
-    [table] = proofs.named([TABLE])
+    [table] = proofs.of_gate([TABLE])
     return columns(start) * table.gate // TABLES_COLUMNS
 
 
 @pytest.mark.parametrize("start", STARTS, ids=lambda start: start.proof)
 def test_every_start_can_reach_its_amount(start: Start) -> None:
-    [row] = proofs.named([start.proof])
+    [row] = proofs.of_gate([start.proof])
     made_up = dataclasses.replace(proof_of(f"count({row.unit}={reach(start)}, failures=0)"),
                                   unit=row.unit)
     assert proofs.run(made_up, start.amount, 1).passed
@@ -73,13 +73,13 @@ def test_all_patches_are_used_and_fit_the_product() -> None:
 
 
 def test_the_rows_amounts_are_those_of_the_list() -> None:
-    [row] = proofs.named(["seeded_defects"])
+    [row] = proofs.of_gate(["seeded_defects"])
     assert row.gate <= len(DEFECTS) == row.step == row.aim == row.full
 
 
 def caught(monkeypatch: pytest.MonkeyPatch, text: str, shown: str) -> bool:
     """Whether a proof that runs this Python text notices."""
-    monkeypatch.setattr(proofs, "named", lambda names: [proof_of(text)])
+    monkeypatch.setattr(proofs, "of_gate", lambda names: [proof_of(text)])
     monkeypatch.setattr(proofs, "build", lambda wanted: None)
     applied: list[tuple[str, ...]] = []
     monkeypatch.setattr(seed, "apply", lambda defect, *options: applied.append(options))

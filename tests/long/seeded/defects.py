@@ -51,6 +51,8 @@ DEFECTS = (
     # The last of the files is new, and those before it are not.
     Defect("reversed-renames.patch", Start("daemon_kills", 60),
            r"^E +against version \d+:\nE +/etc/group: "),
+    Defect("unheeded-digest-error.patch", Start("daemon_faults", 60),
+           r"^E +AssertionError: Fault\(.*\): \(\(\), BusError\(.* digest info for "),
     Defect("missing-argument-check.patch", Start("bus_fuzzing", 2_760),
            r"^E +SUMMARY: AddressSanitizer: heap-buffer-overflow .* in handle_digest\("),
     Defect("vanished-caller-allowed.patch", Start("races", 250),
