@@ -15,6 +15,7 @@ from typing import Any, Iterator
 import pytest
 
 from account_history import Call, History
+from daemon_kill_points import CHANGES, Tracer
 from fault_rules import (CORE_FILES, ERRORS, LEFT_OUT, Expected, Struck, calls_of, expected_of,
                          path_of)
 from harness.accounts import GROUP, PASSWD, SHADOW, AccountFiles
@@ -24,7 +25,6 @@ from harness.passwords import OLD
 from harness.service_fixtures import StartService
 from harness.syslog_socket import SyslogSocket
 from kept_files import FILES, PARAMETERS, TEMPORARIES, Version, difference, read_version
-from kill_points import CHANGES, Tracer
 from killed_service import SIGNATURES, KilledService
 
 SLABINFO = "/proc/slabinfo"

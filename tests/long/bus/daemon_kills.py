@@ -11,13 +11,13 @@ from typing import Iterator
 
 import pytest
 
+from daemon_kill_points import CHANGES, LEFTOVERS, KillPoints, Point
 from harness.accounts import AccountFiles
 from harness.bus import Bus
 from harness.fake_authz import FakeAuthz
 from harness.service_fixtures import StartService
 from harness.syslog_socket import SyslogSocket
 from kill_load import KillLoad
-from kill_points import CHANGES, LEFTOVERS, KillPoints, Point
 from killed_service import REMOVALS, KilledService
 from temporary_watch import TemporaryWatch
 

@@ -12,11 +12,11 @@ from typing import Any, Iterator
 from gi.repository import Gio
 
 from account_history import Call, History
+from daemon_kill_points import Tracer
 from harness.bus import INTERFACE, NAME, BusError
 from harness.monitor import Monitor
 from harness.passwords import MARK
 from harness.wire import Wire
-from kill_points import Tracer
 from killed_service import SIGNATURES, KilledService, same_error
 
 CALLERS = 3

@@ -44,11 +44,11 @@ TRACED = {
     "GetDigestList": r'openat\(AT_FDCWD, "/etc/apache2/digest_auth_passwd", O_RDONLY',
     "GetSlabinfo": r'openat\(AT_FDCWD, "/proc/slabinfo", O_RDONLY',
     **{member: fr'execve\("{path}"' for member, path in RUNS.items()},
-    **{member: r'rename\("/etc/passwd.tmp", "/etc/passwd"\)'
+    **{member: r'rename\("/etc/passwd.tmp", "/etc/passwd"[) ]'
        for member in ("AddSystemUser", "AddUser", "AddUidUser", "RemoveUser")},
-    **{member: r'rename\("/etc/shadow.tmp", "/etc/shadow"\)'
+    **{member: r'rename\("/etc/shadow.tmp", "/etc/shadow"[) ]'
        for member in ("ModifyUser", "ClearUserFields", "ChpasswdUser")},
-    **{member: r'rename\("/etc/group.tmp", "/etc/group"\)'
+    **{member: r'rename\("/etc/group.tmp", "/etc/group"[) ]'
        for member in ("AddGroup", "RemoveGroup")},
 }
 LIBRARY_CALLS = {"Digest": "digest_entry_set_list", "ReadBootblockParam": "bootparam_read",

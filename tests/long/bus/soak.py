@@ -21,6 +21,7 @@ from pathlib import Path
 from typing import Any, Callable, Iterator
 
 import pytest
+from gi.repository import GLib
 
 from harness import packaged, process
 from harness.accounts import AccountFiles
@@ -106,6 +107,9 @@ class Housekeeper(threading.Thread):
                          self._stage.syslog):
                 fake.forget()
             self._stage.forget_output()
+            # Where connections that were closed wait, with all that they have read, to tell of it.
+            while GLib.MainContext.default().iteration(False):
+                pass
             if self._hang_seconds > 0:
                 wanted = self.tools.hang(self._hang_seconds)
                 self._hang_seconds = 0.0
