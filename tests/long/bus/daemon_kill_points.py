@@ -1,4 +1,4 @@
-"""tests/long/bus/daemon_kill_points.py: a kill of the service right before one call on the file system."""
+"""tests/long/bus/daemon_kill_points.py: a kill of the service right before a file-system call."""
 import re
 import subprocess
 from collections import Counter

@@ -77,8 +77,9 @@ class Struck:
 @dataclass
 class Expected:
     """error is None for success: then all files are new but for those in old; else as many of the
-    account files, in their order, as ahead says. warnings: what syslog gets beside what it gets without a fault, now
-    and by the next change of the groups. instead: a line of the log that is another."""
+    account files, in their order, as ahead says. warnings: what syslog gets beside what it gets
+    without a fault, now and by the next change of the groups. instead: a line of the log that is
+    another."""
 
     error: BusError | None = None
     ahead: int = 0
