@@ -3,7 +3,6 @@
 // The methods run behind a real skeleton on a connection of two ends in this process. Authorization
 // and the database are the test's own.
 #include <gtest/gtest.h>
-#include <sys/socket.h>
 
 #include <string>
 #include <vector>
@@ -13,6 +12,7 @@
 #include "methods/accounts/queries.h"
 #include "platform/authz/authz.h"
 #include "service/method.h"
+#include "tests/unit/service/bus_pair.h"
 #include "usermgmt/usermgmt.h"
 
 static constexpr const char *OBJECT_PATH = "/com/zintor/PrivaneSystem";
@@ -85,18 +85,6 @@ static bool work_without_lower_error(method_call &call, const char *) {
     return pass_on(call, "Failed to look: ");
 }
 
-// One end of a connection; the other is made at the same time.
-static void on_connected(GObject *, GAsyncResult *result, gpointer slot) {
-    *static_cast<GDBusConnection **>(slot) = g_dbus_connection_new_finish(result, nullptr);
-}
-
-static void start_end(int fd, GDBusConnectionFlags flags, const char *guid,
-                      GDBusConnection **slot) {
-    g_autoptr(GSocket) socket = g_socket_new_from_fd(fd, nullptr);
-    g_autoptr(GSocketConnection) stream = g_socket_connection_factory_create_connection(socket);
-    g_dbus_connection_new(G_IO_STREAM(stream), guid, flags, nullptr, nullptr, on_connected, slot);
-}
-
 class Frame : public ::testing::Test {
   protected:
     void SetUp() override {
@@ -105,26 +93,16 @@ class Frame : public ::testing::Test {
         failing_group = -1;
         g_log_set_default_handler(record, this);
 
-        int ends[2] = {-1, -1};
-        ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
-        g_autofree char *guid = g_dbus_generate_guid();
-        start_end(ends[0], G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_SERVER, guid, &server_);
-        start_end(ends[1], G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_CLIENT, nullptr, &client_);
-        while (server_ == nullptr || client_ == nullptr)
-            (void)g_main_context_iteration(nullptr, TRUE);
-
+        ASSERT_TRUE(ends_.is_connected());
         state_.skeleton = privane_system__skeleton_new();
         ASSERT_TRUE(g_dbus_interface_skeleton_export(G_DBUS_INTERFACE_SKELETON(state_.skeleton),
-                                                     server_, OBJECT_PATH, nullptr));
+                                                     ends_.server(), OBJECT_PATH, nullptr));
     }
 
     void TearDown() override {
         g_dbus_interface_skeleton_unexport(G_DBUS_INTERFACE_SKELETON(state_.skeleton));
         g_object_unref(state_.skeleton);
-        (void)g_dbus_connection_close_sync(client_, nullptr, nullptr);
-        (void)g_dbus_connection_close_sync(server_, nullptr, nullptr);
-        g_object_unref(client_);
-        g_object_unref(server_);
+        ends_.close();
         g_log_set_default_handler(g_log_default_handler, nullptr);
     }
 
@@ -133,8 +111,8 @@ class Frame : public ::testing::Test {
     // The D-Bus error and its text, or the printed reply.
     std::string answer_of(const char *method, GVariant *arguments) {
         std::string answer;
-        g_dbus_connection_call(client_, nullptr, OBJECT_PATH, INTERFACE, method, arguments, nullptr,
-                               G_DBUS_CALL_FLAGS_NONE, -1, nullptr, on_answer, &answer);
+        g_dbus_connection_call(ends_.client(), nullptr, OBJECT_PATH, INTERFACE, method, arguments,
+                               nullptr, G_DBUS_CALL_FLAGS_NONE, -1, nullptr, on_answer, &answer);
         while (answer.empty())
             (void)g_main_context_iteration(nullptr, TRUE);
         return answer;
@@ -164,8 +142,7 @@ class Frame : public ::testing::Test {
         static_cast<Frame *>(self)->log_.push_back(std::to_string(level) + " " + message);
     }
 
-    GDBusConnection *server_ = nullptr;
-    GDBusConnection *client_ = nullptr;
+    bus_pair ends_;
     ServiceState state_ = {};
     std::vector<std::string> log_;
 };

@@ -5,7 +5,6 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <sys/socket.h>
 
 #include <map>
 #include <string>
@@ -14,6 +13,7 @@
 #include <gio/gio.h>
 
 #include "service/intake.h"
+#include "tests/unit/service/bus_pair.h"
 
 inline constexpr const char *PATH = "/test";
 inline constexpr const char *INTERFACE_XML =
@@ -25,35 +25,17 @@ inline constexpr const char *LIMITS_EXCEEDED = "org.freedesktop.DBus.Error.Limit
 inline constexpr const char *TOO_MANY =
     "org.freedesktop.DBus.Error.LimitsExceeded: Too many calls are waiting";
 
-inline void on_connected(GObject *, GAsyncResult *result, gpointer slot) {
-    *static_cast<GDBusConnection **>(slot) = g_dbus_connection_new_finish(result, nullptr);
-}
-
-inline void start_end(int fd, GDBusConnectionFlags flags, const char *guid,
-                      GDBusConnection **slot) {
-    g_autoptr(GSocket) socket = g_socket_new_from_fd(fd, nullptr);
-    g_autoptr(GSocketConnection) stream = g_socket_connection_factory_create_connection(socket);
-    g_dbus_connection_new(G_IO_STREAM(stream), guid, flags, nullptr, nullptr, on_connected, slot);
-}
-
 class Intake : public ::testing::Test {
   protected:
     void SetUp() override {
-        int ends[2] = {-1, -1};
-        ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
-        g_autofree char *guid = g_dbus_generate_guid();
-        start_end(ends[0], G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_SERVER, guid, &server_);
-        start_end(ends[1], G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_CLIENT, nullptr, &client_);
-        while (server_ == nullptr || client_ == nullptr)
-            (void)g_main_context_iteration(nullptr, TRUE);
-
+        ASSERT_TRUE(ends_.is_connected());
         info_ = g_dbus_node_info_new_for_xml(INTERFACE_XML, nullptr);
-        intake_guard(server_, PATH, info_->interfaces[0]);
+        intake_guard(ends_.server(), PATH, info_->interfaces[0]);
         static constexpr GDBusInterfaceVTable vtable = {serve, nullptr, nullptr, {}};
-        ASSERT_NE(g_dbus_connection_register_object(server_, PATH, info_->interfaces[0], &vtable,
-                                                    this, nullptr, nullptr),
+        ASSERT_NE(g_dbus_connection_register_object(ends_.server(), PATH, info_->interfaces[0],
+                                                    &vtable, this, nullptr, nullptr),
                   0U);
-        g_dbus_connection_add_filter(client_, listen, this, nullptr);
+        g_dbus_connection_add_filter(ends_.client(), listen, this, nullptr);
     }
 
     void TearDown() override {
@@ -61,10 +43,7 @@ class Intake : public ::testing::Test {
             g_dbus_method_invocation_return_value(call, nullptr);
         for (GDBusMessage *message : kept_)
             g_object_unref(message);
-        (void)g_dbus_connection_close_sync(client_, nullptr, nullptr);
-        (void)g_dbus_connection_close_sync(server_, nullptr, nullptr);
-        g_object_unref(client_);
-        g_object_unref(server_);
+        ends_.close();
         g_dbus_node_info_unref(info_);
     }
 
@@ -84,8 +63,8 @@ class Intake : public ::testing::Test {
         if (silent)
             g_dbus_message_set_flags(message, G_DBUS_MESSAGE_FLAGS_NO_REPLY_EXPECTED);
         volatile guint32 serial = 0;
-        EXPECT_TRUE(g_dbus_connection_send_message(client_, message, G_DBUS_SEND_MESSAGE_FLAGS_NONE,
-                                                   &serial, nullptr));
+        EXPECT_TRUE(g_dbus_connection_send_message(
+            ends_.client(), message, G_DBUS_SEND_MESSAGE_FLAGS_NONE, &serial, nullptr));
         return serial;
     }
 
@@ -110,7 +89,7 @@ class Intake : public ::testing::Test {
             g_dbus_message_new_method_call(nullptr, PATH, "org.freedesktop.DBus.Peer", "Ping");
         g_dbus_message_set_sender(ping, (":settler." + std::to_string(settled_++)).c_str());
         g_autoptr(GDBusMessage) answer = g_dbus_connection_send_message_with_reply_sync(
-            client_, ping, G_DBUS_SEND_MESSAGE_FLAGS_NONE, -1, nullptr, nullptr, nullptr);
+            ends_.client(), ping, G_DBUS_SEND_MESSAGE_FLAGS_NONE, -1, nullptr, nullptr, nullptr);
         ASSERT_NE(answer, nullptr);
     }
 
@@ -141,8 +120,7 @@ class Intake : public ::testing::Test {
     guint served_ = 0;
     bool keeps_messages_ = false;
     bool holds_calls_ = false;
-    GDBusConnection *server_ = nullptr;
-    GDBusConnection *client_ = nullptr;
+    bus_pair ends_;
 
   private:
     static void serve(GDBusConnection *, const char *, const char *, const char *, const char *,

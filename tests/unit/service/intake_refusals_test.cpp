@@ -15,6 +15,7 @@
 #include <malloc.h>
 
 #include "service/intake.h"
+#include "tests/unit/service/bus_pair.h"
 
 static constexpr const char *PATH = "/test";
 static constexpr const char *INTERFACE_XML =
@@ -33,10 +34,7 @@ class IntakeRefusals : public ::testing::Test {
         const struct timeval patience = {30, 0};
         ASSERT_EQ(setsockopt(peer_fd_, SOL_SOCKET, SO_RCVTIMEO, &patience, sizeof patience), 0);
 
-        g_autoptr(GSocket) socket = g_socket_new_from_fd(server_fd_, nullptr);
-        g_autoptr(GSocketConnection) stream = g_socket_connection_factory_create_connection(socket);
-        server_ = g_dbus_connection_new_sync(
-            G_IO_STREAM(stream), nullptr, G_DBUS_CONNECTION_FLAGS_NONE, nullptr, nullptr, nullptr);
+        server_ = connect_bus_end(server_fd_);
         ASSERT_NE(server_, nullptr);
         info_ = g_dbus_node_info_new_for_xml(INTERFACE_XML, nullptr);
         intake_guard(server_, PATH, info_->interfaces[0]);

@@ -167,7 +167,7 @@ TEST_F(Intake, CallUnderTheNumberOfOneThatWaitsIsDropped) {
         g_dbus_message_set_body(message, g_variant_new("(s)", "x"));
         g_dbus_message_set_serial(message, 4000);
         (void)g_dbus_connection_send_message(
-            client_, message, G_DBUS_SEND_MESSAGE_FLAGS_PRESERVE_SERIAL, nullptr, nullptr);
+            ends_.client(), message, G_DBUS_SEND_MESSAGE_FLAGS_PRESERVE_SERIAL, nullptr, nullptr);
     }
     serve_all();
     EXPECT_EQ(served_, 2U);
@@ -233,7 +233,7 @@ TEST_F(Intake, CallsThatGdbusAnswersAreDroppedWhenTheyWantNoAnswer) {
 TEST_F(Intake, SignalsToThisConnectionAloneAreDropped) {
     guint heard = 0;
     const guint id = g_dbus_connection_signal_subscribe(
-        server_, nullptr, "test.Other", "Told", nullptr, nullptr, G_DBUS_SIGNAL_FLAGS_NONE,
+        ends_.server(), nullptr, "test.Other", "Told", nullptr, nullptr, G_DBUS_SIGNAL_FLAGS_NONE,
         [](GDBusConnection *, const char *, const char *, const char *, const char *, GVariant *,
            gpointer counter) { ++*static_cast<guint *>(counter); },
         &heard, nullptr);
@@ -250,10 +250,10 @@ TEST_F(Intake, SignalsToThisConnectionAloneAreDropped) {
         g_autoptr(GDBusMessage) message = g_dbus_message_new_signal("/other", "test.Other", "Told");
         g_dbus_message_set_sender(message, one.sender);
         g_dbus_message_set_destination(message, one.destination);
-        (void)g_dbus_connection_send_message(client_, message, G_DBUS_SEND_MESSAGE_FLAGS_NONE,
-                                             nullptr, nullptr);
+        (void)g_dbus_connection_send_message(ends_.client(), message,
+                                             G_DBUS_SEND_MESSAGE_FLAGS_NONE, nullptr, nullptr);
     }
     serve_all();
     EXPECT_EQ(heard, 2U);
-    g_dbus_connection_signal_unsubscribe(server_, id);
+    g_dbus_connection_signal_unsubscribe(ends_.server(), id);
 }

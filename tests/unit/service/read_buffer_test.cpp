@@ -2,41 +2,27 @@
 //
 // The other end of the connection is the test, which gives none back unless it wants to.
 #include <gtest/gtest.h>
-#include <sys/socket.h>
 
 #include <gio/gio.h>
 
 #include "service/read_buffer.h"
+#include "tests/unit/service/bus_pair.h"
 
 static constexpr const char *INTERFACE_XML =
     "<node><interface name='test.Interface'><method name='Take'/></interface></node>";
 
-static GDBusConnection *connect_end(int fd) {
-    g_autoptr(GSocket) socket = g_socket_new_from_fd(fd, nullptr);
-    g_autoptr(GSocketConnection) stream = g_socket_connection_factory_create_connection(socket);
-    return g_dbus_connection_new_sync(G_IO_STREAM(stream), nullptr, G_DBUS_CONNECTION_FLAGS_NONE,
-                                      nullptr, nullptr, nullptr);
-}
-
 class ReadBuffer : public ::testing::Test {
   protected:
     void SetUp() override {
-        int ends[2] = {-1, -1};
-        ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends), 0);
-        server_ = connect_end(ends[0]);
-        client_ = connect_end(ends[1]);
-        ASSERT_TRUE(server_ != nullptr && client_ != nullptr);
+        ASSERT_TRUE(ends_.is_connected());
         info_ = g_dbus_node_info_new_for_xml(INTERFACE_XML, nullptr);
-        read_buffer_guard(server_, info_->interfaces[0]);
-        g_dbus_connection_add_filter(client_, count_zeros, this, nullptr);
+        read_buffer_guard(ends_.server(), info_->interfaces[0]);
+        g_dbus_connection_add_filter(ends_.client(), count_zeros, this, nullptr);
     }
 
     void TearDown() override {
-        (void)g_dbus_connection_close_sync(client_, nullptr, nullptr);
-        (void)g_dbus_connection_close_sync(server_, nullptr, nullptr);
+        ends_.close();
         g_clear_object(&first_);
-        g_object_unref(client_);
-        g_object_unref(server_);
         g_dbus_node_info_unref(info_);
     }
 
@@ -45,7 +31,7 @@ class ReadBuffer : public ::testing::Test {
         g_autoptr(GDBusMessage) call =
             g_dbus_message_new_method_call(nullptr, "/", interface, member);
         g_autoptr(GDBusMessage) answer = g_dbus_connection_send_message_with_reply_sync(
-            client_, call, G_DBUS_SEND_MESSAGE_FLAGS_NONE, -1, nullptr, nullptr, nullptr);
+            ends_.client(), call, G_DBUS_SEND_MESSAGE_FLAGS_NONE, -1, nullptr, nullptr, nullptr);
         ASSERT_NE(answer, nullptr);
     }
 
@@ -55,7 +41,7 @@ class ReadBuffer : public ::testing::Test {
 
     // Of the zeros that come, the first are given back when the test says so, the others never.
     void keep_first() { g_atomic_int_set(&keeps_first_, 1); }
-    void give_back_first() { give_back(client_, g_atomic_pointer_get(&first_)); }
+    void give_back_first() { give_back(ends_.client(), g_atomic_pointer_get(&first_)); }
 
     gint gives_back_ = 0;
 
@@ -81,8 +67,7 @@ class ReadBuffer : public ::testing::Test {
                                              nullptr, nullptr);
     }
 
-    GDBusConnection *server_ = nullptr;
-    GDBusConnection *client_ = nullptr;
+    bus_pair ends_;
     GDBusNodeInfo *info_ = nullptr;
     gint zeros_ = 0;
     gint keeps_first_ = 0;
