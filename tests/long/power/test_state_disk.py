@@ -8,12 +8,14 @@ import zlib
 from pathlib import Path
 
 import pytest
+import state_disk
 from boot_copies import COPY_SIZE, active_parameters
 from cut_states import State
 from made_logs import made_log, marked, written
+from mounted_state import NotMounted, read_mounted
 from recorded_run import ANSWERS, DISK_SIZE, FILE_SYSTEM_SIZE, LOG, STEPS, RecordedRun
-from state_disk import (ENVIRONMENT, PATHS, BrokenFileSystem, StateDisk, copy_data,
-                        sparse_file)
+from state_disk import (ENVIRONMENT, PATHS, STATES_TO_A_MOUNT, BrokenFileSystem, StateDisk,
+                        copy_data, is_mounted, sparse_file)
 from write_log import FLUSH
 
 CONTENT = {"passwd": b"root:x:0:0:\n", "shadow": b"debugfs: no command\n", "group": b""}
@@ -120,6 +122,39 @@ def test_a_file_system_that_is_not_in_order(commands: list[str], fault: str | No
     else:
         with pytest.raises(BrokenFileSystem, match=fault):
             damaged.left_by(state(2))
+
+
+def test_the_kernel_finds_the_same_files(disk: StateDisk, monkeypatch: pytest.MonkeyPatch) -> None:
+    monkeypatch.setattr(state_disk, "is_mounted", lambda _: True)
+    mounts = Path("/proc/mounts").read_text()
+    left = disk.left_by(state(3))
+    assert left["shadow"] is not None and left["shadow"][3] == CONTENT["shadow"]
+    assert left["digest"] is None
+    assert Path("/proc/mounts").read_text() == mounts
+    monkeypatch.setattr(state_disk, "read_mounted", lambda *_: {**left, "group": None})
+    with pytest.raises(BrokenFileSystem, match="mounted by the kernel, it has another group"):
+        disk.left_by(state(3))
+
+
+def test_files_of_a_mounted_disk(disk_image: bytes, tmp_path: Path) -> None:
+    image, folder = tmp_path / "image", tmp_path / "folder"
+    folder.mkdir()
+    image.write_bytes(disk_image[:FILE_SYSTEM_SIZE])
+    owner = os.getuid(), os.getgid()
+    assert read_mounted(image, folder, PATHS) == {
+        "passwd": (0o644, *owner, CONTENT["passwd"]),
+        "shadow": (0o640, *owner, CONTENT["shadow"]),
+        "group": (0o644, *owner, b""), "digest": None, "parameters": None}
+    assert not list(folder.iterdir())
+    image.write_bytes(b"\0" * FILE_SYSTEM_SIZE)
+    with pytest.raises(NotMounted, match="wrong fs type"):
+        read_mounted(image, folder, PATHS)
+
+
+def test_every_twentieth_state_is_mounted() -> None:
+    states = [state(base, *extra) for base in range(2000) for extra in ((), (base + 1,))]
+    chosen = sum(map(is_mounted, states))
+    assert 0.5 < chosen * STATES_TO_A_MOUNT / len(states) < 1.5
 
 
 def test_the_boot_copy_that_counts() -> None:
