@@ -1,4 +1,4 @@
-// platform/authz/authz_error.h: how the library's own sources set its errors; internal.
+// platform/authz/authz_error.h: how the libraries' own sources set their errors; internal.
 #pragma once
 
 #include <glib.h>
@@ -7,6 +7,3 @@
 
 // The domain is never registered with GDBus: over the bus a caller sees its name and the code.
 #define AUTHZ_ERROR_DOMAIN g_quark_from_string("authz")
-
-// Polkit's name on the bus, the service that decides.
-static constexpr const char *POLKIT_NAME = "org.freedesktop.PolicyKit1";

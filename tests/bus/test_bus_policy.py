@@ -74,6 +74,7 @@ def test_nothing_else_of_a_member_reaches_the_service(
 
 
 # GDBus takes a reply by its number alone, whoever sent it.
+@pytest.mark.polkit
 @pytest.mark.parametrize("liar", ["stranger", "clerk"])
 def test_forged_answer_of_polkit_allows_nothing(liar: str, start: StartService, bus: Bus,
                                                 request: pytest.FixtureRequest) -> None:

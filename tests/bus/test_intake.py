@@ -161,7 +161,7 @@ def test_a_call_that_carries_descriptors_is_refused(service: Service, bus: Bus) 
 
 
 def test_answers_to_the_services_own_calls_pass(real_service: Service, bus: Bus) -> None:
-    # polkit's, of which each call needs one.
+    # Of polkit, one a call, or of the bus.
     for _ in range(3 * SHARED_CALLS):
         assert bus.call("CheckUser", "s", "root") == (True,)
 

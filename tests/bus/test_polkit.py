@@ -3,59 +3,29 @@ import time
 
 import pytest
 
-from harness.accounts import CLERK_UID
 from harness.bus import Bus, BusError, User, domain_error, error_of
 from harness.deadline import wait_for
-from harness.interface import (ACTION_PREFIX, DECLARED_ACTIONS, METHODS, QUERIES,
-                               UNIT_ACTIONS, Method)
+from harness.interface import ACTION_PREFIX, DECLARED_ACTIONS, UNIT_ACTIONS
 from harness.polkit import ExampleRules, actions, check, hanging_polkitd
+from harness.roles import OPERATOR_ACTIONS, VIEWER_ACTIONS
 from harness.sandbox import fake_library
-from harness.service import Service
 from harness.service_fixtures import StartService
+
+pytestmark = pytest.mark.polkit
 
 # The answers of EnumerateActions: not authorized for any session, nor for an active one.
 REFUSED_TO_ALL = (0, 0, 0)
 
-AUTHZ_REFUSED, AUTHZ_TIMED_OUT = 1, 4
+AUTHZ_TIMED_OUT = 4
 # Of the library that has a short one.
 SHORT_DEADLINE = 0.3
-
-VIEWER_ACTIONS = {ACTION_PREFIX + name for name in (
-    "checkuser", "checkgroup", "getuser", "getuserlist", "getgroup", "getgrouplist",
-    "getgrouplistfull")}
-
-OPERATOR_ACTIONS = {ACTION_PREFIX + name for name in (
-    "adjtime", "executeethtool", "executelldpcli", "executesmartctl", "getactivenetworkinfo.all",
-    "getactivenetworkinfo.tcp-udp", "getnetworkspeedduplex", "getslabinfo", "notifytimesync",
-    "readserno", "reboot", "restartntp", "settimeofday", "startlensd", "startntp", "stoplensd",
-    "stopntp")}
-
-NONE: set[str] = set()
 
 # Those of the methods on units decide where a unit has none of its own.
 DECLARED = DECLARED_ACTIONS | {ACTION_PREFIX + name for name in UNIT_ACTIONS}
 
 every_declared_action = pytest.mark.parametrize("action", sorted(DECLARED))
-every_method = pytest.mark.parametrize("method", METHODS,
-                                                   ids=lambda method: method.member)
 
-
-def call(caller: Bus | User, method: Method) -> object:
-    return caller.call(method.member, method.signature, *method.arguments)
-
-
-def is_authorized(caller: Bus | User, method: Method) -> bool:
-    """Whether the call got past the authorization; what it did then may have failed here."""
-    try:
-        call(caller, method)
-    except BusError as error:
-        return not error.text.startswith("Authorization check failed: ")
-    return True
-
-
-def refusal(action: str, uid: int) -> BusError:
-    return domain_error("authz", AUTHZ_REFUSED, f"Authorization check failed: action {action} "
-                                                f"is refused to uid {uid}")
+NONE: set[str] = set()
 
 
 def test_there_are_46_actions() -> None:
@@ -84,37 +54,6 @@ def test_action_that_is_not_declared_is_an_error_for_root_too(action: str, bus: 
     assert f"Action {ACTION_PREFIX}{action} is not registered" in error.text
 
 
-@every_method
-def test_user_is_refused_through_the_service(method: Method, real_service: Service,
-                                             clerk: User) -> None:
-    before = real_service.output()
-    expected = refusal(method.action_id, CLERK_UID)
-
-    assert error_of(call, clerk, method) == expected
-    assert real_service.output() == before + [f"warning: {expected.text}"]
-
-
-@every_method
-def test_root_is_allowed_through_the_service(method: Method, real_service: Service,
-                                             bus: Bus) -> None:
-    assert is_authorized(bus, method)
-
-    assert not [line for line in real_service.output() if "Authorization" in line]
-
-
-@every_method
-def test_role_is_allowed_through_the_service(method: Method, real_service: Service, bus: Bus,
-                                             viewer: User, operator: User, clerk: User,
-                                             rules: ExampleRules) -> None:
-    for user, granted in ((viewer, VIEWER_ACTIONS), (operator, OPERATOR_ACTIONS), (clerk, NONE)):
-        if method.action_id in granted:
-            assert is_authorized(user, method)
-            if method in QUERIES:
-                assert call(user, method) == call(bus, method)
-        else:
-            assert error_of(call, user, method) == refusal(method.action_id, user.uid)
-
-
 def test_example_rules_grant_a_role_its_actions_only(bus: Bus, viewer: User, operator: User,
                                                      clerk: User, rules: ExampleRules) -> None:
     def allowed(user: User) -> set[str]:
@@ -123,16 +62,6 @@ def test_example_rules_grant_a_role_its_actions_only(bus: Bus, viewer: User, ope
     assert allowed(viewer) == VIEWER_ACTIONS
     assert allowed(operator) == OPERATOR_ACTIONS
     assert allowed(clerk) == NONE
-
-
-def test_rules_that_go_take_their_grants_along(real_service: Service, viewer: User,
-                                               rules: ExampleRules) -> None:
-    assert viewer.call("CheckUser", "s", "root") == (True,)
-
-    rules.remove()
-
-    assert error_of(viewer.call, "CheckUser", "s", "root") == refusal(
-        ACTION_PREFIX + "checkuser", viewer.uid)
 
 
 def silence(action: str) -> BusError:

@@ -16,6 +16,8 @@ from harness.service import Service
 from harness.service_fixtures import StartService
 from harness.wire import Wire, as_user
 
+pytestmark = pytest.mark.polkit
+
 CALLS = 10
 
 # Longer than libauthz waits before it looks whether the answer was lost.

@@ -1,4 +1,5 @@
-"""tests/bus/test_polkit_units.py: who may act on which unit, by the real polkitd."""
+"""tests/bus/test_polkit_units.py: who may act on which unit: root, nobody, and whom
+the real polkitd allows it."""
 import os
 import signal
 import subprocess
@@ -125,6 +126,7 @@ def test_user_is_refused_with_the_name_of_the_action(method: str, unit: str, cle
     assert systemd.take_calls() == []
 
 
+@pytest.mark.polkit
 @every_unit_method
 def test_rule_on_the_parent_grants_one_unit(method: str, clerk: User, bus: Bus,
                                             real_service: Service, systemd: Systemd) -> None:
@@ -140,6 +142,7 @@ def test_rule_on_the_parent_grants_one_unit(method: str, clerk: User, bus: Bus,
     assert systemd.take_calls() == []
 
 
+@pytest.mark.polkit
 def test_rule_grants_its_user_alone(clerk: User, viewer: User, bus: Bus, real_service: Service,
                                     systemd: Systemd) -> None:
     with local_rules(bus, clerk, rule_on_unit("startservice", "sshd")):
@@ -148,6 +151,7 @@ def test_rule_grants_its_user_alone(clerk: User, viewer: User, bus: Bus, real_se
     assert systemd.take_calls() == []
 
 
+@pytest.mark.polkit
 def test_template_is_told_from_a_unit_of_its_name(clerk: User, bus: Bus, real_service: Service,
                                                   systemd: Systemd) -> None:
     with local_rules(bus, clerk, rule_on_unit("startservice", "getty@")):
@@ -159,6 +163,7 @@ def test_template_is_told_from_a_unit_of_its_name(clerk: User, bus: Bus, real_se
     assert systemd.take_calls() == []
 
 
+@pytest.mark.polkit
 def test_details_name_the_own_action(clerk: User, bus: Bus, real_service: Service,
                                      systemd: Systemd) -> None:
     condition = f'action.lookup("action") === "{ACTION_PREFIX}startservice.getty.any"'
@@ -175,6 +180,7 @@ BAD_NAMES = ["sshd.service", "sshd.any", "SSHD", "sshd ", " sshd", "sshd\n", "ss
              "sshd!", "ssh\u0501", "sshd*", "s_shd"]
 
 
+@pytest.mark.polkit
 @pytest.mark.parametrize("unit", ODD_NAMES)
 def test_odd_name_gets_nobody_past_a_rule(unit: str, clerk: User, bus: Bus, real_service: Service,
                                           systemd: Systemd) -> None:
@@ -208,6 +214,7 @@ def names_of(*units: str) -> set[str]:
             if method != "SetDefaultTarget"}
 
 
+@pytest.mark.polkit
 def test_polkitd_takes_all_that_the_generator_declares(bus: Bus, clerk: User) -> None:
     services = ("sshd", "recorder@", "a" * 64, "-0", "any")
     names = names_of(*services) | {own_action("SetDefaultTarget", "rescue")}
@@ -222,6 +229,7 @@ def test_polkitd_takes_all_that_the_generator_declares(bus: Bus, clerk: User) ->
             assert check(bus, bus.unique_name, name) is True
 
 
+@pytest.mark.polkit
 @pytest.mark.parametrize("unit, declaration", [("sshd", "sshd.service"),
                                                ("getty@tty1", "getty@.service")])
 def test_declared_action_decides_instead_of_its_parent(unit: str, declaration: str, clerk: User,
@@ -237,6 +245,7 @@ def test_declared_action_decides_instead_of_its_parent(unit: str, declaration: s
     assert systemd.take_calls() == [expected_call("StartService", unit)] * 3
 
 
+@pytest.mark.polkit
 def test_declared_action_is_granted_by_itself(clerk: User, bus: Bus, real_service: Service,
                                               systemd: Systemd) -> None:
     granted = rule(f'action.id === "{ACTION_PREFIX}startservice.getty.any"')
@@ -250,6 +259,7 @@ def test_declared_action_is_granted_by_itself(clerk: User, bus: Bus, real_servic
     assert systemd.take_calls() == [expected_call("StartService", "getty@tty1")]
 
 
+@pytest.mark.polkit
 def test_example_grants_what_it_says(accounts: AccountFiles, clerk: User, viewer: User, bus: Bus,
                                      real_service: Service, systemd: Systemd) -> None:
     accounts.write(STANDARD_PASSWD, STANDARD_SHADOW,
@@ -277,6 +287,7 @@ def start_polkitd(bus: Bus, program: str) -> None:
     wait_for("polkitd", lambda: bus.owner(AUTHORITY[0]), ANSWER_SECONDS)
 
 
+@pytest.mark.polkit
 def test_without_polkitd_nobody_is_allowed(clerk: User, bus: Bus, real_service: Service,
                                            systemd: Systemd) -> None:
     with local_rules(bus, clerk, rule_on_unit("startservice", "sshd")):

@@ -30,6 +30,7 @@ def test_quit_signal_ends_the_service(mode: str, number: signal.Signals, start: 
     assert authz.calls() == ["init 1", "release"]
 
 
+@pytest.mark.real_authz
 @pytest.mark.parametrize("mode", MODES)
 def test_quit_signal_ends_the_service_with_the_real_authorization(
         mode: str, start: StartService, bus: Bus) -> None:

@@ -132,7 +132,8 @@ def test_no_thread_starts_before_the_detaching_with_the_real_authorization(
             if call.pid == service.pid and "CLONE_THREAD" in call.rest]
 
 
-def test_daemon_asks_polkit_although_it_detached(start: StartService, bus: Bus) -> None:
+@pytest.mark.real_authz
+def test_daemon_authorizes_although_it_detached(start: StartService, bus: Bus) -> None:
     service = start(())
     service.wait_registered(bus)
 

@@ -76,6 +76,7 @@ def test_failing_authorization_ends_the_daemon_before_it_detaches(
 NO_BUS = "Failed to initialize libauthz: Could not connect: No such file or directory"
 
 
+@pytest.mark.polkit
 def test_missing_bus_fails_the_real_authorization_in_the_foreground(
         start: StartService, syslog: SyslogSocket, tmp_path: Path) -> None:
     trace = database_trace(tmp_path / "trace")
@@ -87,6 +88,7 @@ def test_missing_bus_fails_the_real_authorization_in_the_foreground(
     assert trace.calls() == []
 
 
+@pytest.mark.polkit
 def test_missing_bus_fails_the_real_authorization_before_detaching(
         start: StartService, syslog: SyslogSocket, tmp_path: Path) -> None:
     trace = database_trace(tmp_path / "trace")

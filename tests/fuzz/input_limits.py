@@ -23,6 +23,7 @@ MAX_INPUTS = {
     "operations": 200,  # the files and six operations
     "parameters": 4608,  # more than the 4096 bytes of a full block
     "passwd_lines": 1152,
+    "policy_file": 640,  # a name of 256 bytes, twice
     "replies": 560,  # seven parts
     "shadow_lines": 1152,
 }

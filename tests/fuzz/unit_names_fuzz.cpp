@@ -4,7 +4,7 @@
 #include <cstring>
 
 #include "methods/system/unit_control.h"
-#include "platform/authz/unit_action.h"
+#include "platform/authz/polkit/unit_action.h"
 #include "tests/fuzz/bus_call.h"
 #include "tests/fuzz/fuzz.h"
 

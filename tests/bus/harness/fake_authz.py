@@ -1,5 +1,5 @@
 """tests/bus/harness/fake_authz.py: the test's side of tests/fakes/authz, and what stands in its
-place where polkit decides."""
+place where our own library decides."""
 from dataclasses import dataclass
 from pathlib import Path
 
@@ -15,9 +15,8 @@ class Check:
     action: str
 
 
-class PolkitDecides:
-    """In the place of the fake: our own library in front of the sandbox's polkit, the installed one
-    or another build of it."""
+class OwnAuthz:
+    """In the place of the fake: our own library, the installed one or another build of it."""
 
     def __init__(self, library: Path | None = None) -> None:
         self._library = library

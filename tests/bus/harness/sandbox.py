@@ -40,6 +40,16 @@ def fake_library(name: str) -> Path:
     return library
 
 
+# Which of our two libauthz is installed.
+POLKIT, POLICY_FILE = "polkit", "policy-file"
+
+
+def authorization() -> str:
+    chosen = os.environ["BUS_RING_AUTHZ"]
+    assert chosen in (POLKIT, POLICY_FILE), chosen
+    return chosen
+
+
 def polkitd_pid() -> int:
     return int((STATE / "polkitd.pid").read_text())
 

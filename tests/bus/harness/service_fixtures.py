@@ -8,11 +8,13 @@ import pytest
 from harness import process
 from harness.accounts import (CLERK_UID, OPERATOR_ROLE_GID, OPERATOR_UID, STANDARD_GROUP,
                               STANDARD_PASSWD, STANDARD_SHADOW, STRANGER_UID, VIEWER_ROLE_GID,
-                              VIEWER_UID, AccountFiles)
+                              VIEWER_UID, AccountFiles, replace)
 from harness.bus import Bus, User
 from harness.fake_authz import FakeAuthz
+from harness.policy_file import POLICY, ExamplePolicy
 from harness.polkit import ExampleRules
-from harness.sandbox import STATE, polkitd_pid, require_sandbox
+from harness.roles import Roles
+from harness.sandbox import POLKIT, STATE, authorization, polkitd_pid, require_sandbox
 from harness.service import Service
 from harness.syslog_socket import SyslogSocket
 from harness.world import Neighbour
@@ -29,6 +31,18 @@ def pytest_sessionstart() -> None:
     except RuntimeError as error:
         pytest.exit(str(error), returncode=125)
     process.adopt_orphans()
+
+
+def pytest_collection_modifyitems(config: pytest.Config, items: list[pytest.Item]) -> None:
+    """Marks the tests that ask the real authorization, and leaves out those of the other one."""
+    for item in items:
+        if "real_service" in getattr(item, "fixturenames", ()):
+            item.add_marker("real_authz")
+    other = "policy_file" if authorization() == POLKIT else "polkit"
+    left_out = [item for item in items if item.get_closest_marker(other)]
+    if left_out:
+        config.hook.pytest_deselected(items=left_out)
+        items[:] = [item for item in items if item not in left_out]
 
 
 def pytest_terminal_summary(terminalreporter: Any, exitstatus: int) -> None:
@@ -58,6 +72,21 @@ def accounts(account_files: AccountFiles) -> Iterator[AccountFiles]:
     """The account files, with the standard accounts at the start of the test."""
     yield account_files
     account_files.write(STANDARD_PASSWD, STANDARD_SHADOW, STANDARD_GROUP)
+
+
+@pytest.fixture(scope="session")
+def packaged_policy() -> str | None:
+    """The policy file as it was installed; None with polkit."""
+    return None if authorization() == POLKIT else POLICY.read_text()
+
+
+@pytest.fixture(autouse=True)
+def policy_stays(packaged_policy: str | None) -> Iterator[None]:
+    """It is there at the start of each test: some empty its folder."""
+    yield
+    if packaged_policy is not None and not POLICY.exists():
+        POLICY.parent.mkdir(exist_ok=True)
+        replace(POLICY, packaged_policy, 0o644, 0)
 
 
 @pytest.fixture(scope="session")
@@ -108,7 +137,7 @@ def service(start: StartService, authz: FakeAuthz, bus: Bus) -> Iterator[Service
 
 @pytest.fixture
 def real_service(start: StartService, bus: Bus) -> Iterator[Service]:
-    """The service in the foreground, with polkit deciding; it must survive the test."""
+    """The service in the foreground, with our own authorization; it must survive the test."""
     running = start()
     running.wait_registered(bus)
     yield running
@@ -152,9 +181,10 @@ def operator(privane_gid: int) -> Iterator[User]:
 
 
 @pytest.fixture
-def rules(bus: Bus, viewer: User, operator: User) -> Iterator[ExampleRules]:
-    """The packaged example rules, in effect."""
-    packaged = ExampleRules(bus, {"viewer": viewer, "operator": operator})
+def rules(bus: Bus, viewer: User, operator: User) -> Iterator[Roles]:
+    """The packaged example roles, in effect."""
+    packaged: Roles = (ExampleRules(bus, {"viewer": viewer, "operator": operator})
+                       if authorization() == POLKIT else ExamplePolicy())
     packaged.install()
     yield packaged
     packaged.remove()

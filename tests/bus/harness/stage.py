@@ -5,7 +5,7 @@ from pathlib import Path
 from typing import Any, Callable, Protocol, Sequence
 
 from harness.bus import Bus, BusError, domain_error
-from harness.fake_authz import FakeAuthz, PolkitDecides
+from harness.fake_authz import FakeAuthz, OwnAuthz
 from harness.fake_folder import Call, FakeDigest, FakeParamcli, StandInTool, together
 from harness.interface import METHODS
 from harness.passwords import MARK
@@ -62,7 +62,7 @@ class Stage:
     """The service with a fake libauthz, fake or our own stores behind it, a stand-in for pidof, a
     process named cfgstore that pidof finds, and other fakes, which their maker closes."""
 
-    def __init__(self, start: Callable[..., Service], bus: Bus, authz: FakeAuthz | PolkitDecides,
+    def __init__(self, start: Callable[..., Service], bus: Bus, authz: FakeAuthz | OwnAuthz,
                  syslog: SyslogSocket, directory: Path, fake_stores: bool = True,
                  others: Sequence[Fake] = ()) -> None:
         self.bus = bus

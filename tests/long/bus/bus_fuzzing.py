@@ -21,7 +21,7 @@ from harness.accounts import (CLERK_UID, STANDARD_GROUP, STANDARD_PASSWD, STANDA
 from harness.bus import INTERFACE, NAME, PATH, Bus, BusError, domain_error
 from harness.deadline import wait_for
 from harness.device import Device
-from harness.fake_authz import CODE, DOMAIN, FakeAuthz, PolkitDecides
+from harness.fake_authz import CODE, DOMAIN, FakeAuthz, OwnAuthz
 from harness.passwords import OLD_HASH
 from harness.service import Service
 from harness.stage import Stage
@@ -241,7 +241,7 @@ def begin(sanitized: Sanitized, accounts: AccountFiles, bus: Bus, syslog: Syslog
     bounding = int(process.status(os.getpid())["CapBnd"], 16)
     assert not bounding & (1 << CAP_SYS_TIME | 1 << CAP_SYS_BOOT), "this clock is the machine's"
 
-    def begin_stage(authz: FakeAuthz | PolkitDecides) -> Stage:
+    def begin_stage(authz: FakeAuthz | OwnAuthz) -> Stage:
         accounts.write(PASSWD_TEXT, SHADOW_TEXT, GROUP_TEXT)
         stage = Stage(sanitized, bus, authz, syslog, tmp_path, others=device.fakes())
         maps = Path(f"/proc/{stage.service.pid}/maps").read_text()
@@ -286,7 +286,7 @@ class Bout:
         self._chance = chance
         self._figures = figures
 
-    def run(self, amount: int, authz: FakeAuthz | PolkitDecides) -> None:
+    def run(self, amount: int, authz: FakeAuthz | OwnAuthz) -> None:
         stage = self._begin(authz)
         methods = methods_of(stage.bus)
         assert len(methods) == METHOD_COUNT
@@ -322,7 +322,7 @@ class Bout:
         fuzzing.forget()
 
     def _refused(self, fuzzing: Fuzzing, methods: dict[str, tuple[str, str]],
-                 batch: Sequence[str], authz: FakeAuthz | PolkitDecides) -> None:
+                 batch: Sequence[str], authz: FakeAuthz | OwnAuthz) -> None:
         before, known = world(fuzzing.stage.cfgstore), fuzzing.known()
         lines, refusal = self._callers.clerk, refusal_by_polkit
         if isinstance(authz, FakeAuthz):
@@ -349,7 +349,7 @@ def test_fake_authorization(bout: Bout, authz: FakeAuthz, amount: int) -> None:
 
 
 def test_polkit(bout: Bout, amount: int) -> None:
-    bout.run(max(1, int(amount * POLKIT_SHARE)), PolkitDecides())
+    bout.run(max(1, int(amount * POLKIT_SHARE)), OwnAuthz())
 
 
 def test_all_was_asked(figures: Counter[str], amount: int) -> None:

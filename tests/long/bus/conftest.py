@@ -12,6 +12,9 @@ import pytest
 
 pytest_plugins = ["harness.service_fixtures", "harness.stage_fixtures", "harness.device_fixtures"]
 
+# What the matrices share tells of a failure what was compared, as a module of tests does.
+pytest.register_assert_rewrite("authorization_table")
+
 FIGURES = pytest.StashKey[Counter]()
 
 

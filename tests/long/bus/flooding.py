@@ -29,7 +29,7 @@ ALLOWED = FLOODERS.count(CLERK_UID)
 
 # For want of room, by the service or by the bus.
 REFUSED = "org.freedesktop.DBus.Error.LimitsExceeded"
-# What polkit answers waits as all that the service is sent, platform/authz/polkit_client.cpp.
+# What polkit answers waits as all that the service is sent, platform/authz/polkit/polkit_client.cpp.
 NOT_IN_TIME = "no answer in time"
 PATIENCE = 60.0
 READY = 30.0

@@ -20,7 +20,7 @@ from harness.accounts import (GROUP, PASSWD, SHADOW, STANDARD_GROUP, STANDARD_PA
 from harness.bus import NAME, Bus
 from harness.deadline import wait_for
 from harness.device import SYSFLASH, Device
-from harness.fake_authz import PolkitDecides
+from harness.fake_authz import OwnAuthz
 from harness.interface import METHODS
 from harness.monitor import BUS, CALL, ERROR, Record, is_end_of
 from harness.service import Service
@@ -52,7 +52,7 @@ def stage(accounts: AccountFiles, device: Device, hardware_clock: Path,
           start: Callable[..., Service], bus: Bus, syslog: SyslogSocket,
           tmp_path: Path) -> Iterator[Stage]:
     accounts.write(STANDARD_PASSWD, STANDARD_SHADOW.replace(":7:::", ":7:0::"), STANDARD_GROUP)
-    yield from run_stage(Stage(start, bus, PolkitDecides(), syslog, tmp_path,
+    yield from run_stage(Stage(start, bus, OwnAuthz(), syslog, tmp_path,
                                others=device.fakes()))
 
 

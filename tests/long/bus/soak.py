@@ -28,7 +28,7 @@ from harness.accounts import AccountFiles
 from harness.bus import Bus, error_of
 from harness.deadline import wait_for
 from harness.device import LLDPCLI, Device
-from harness.fake_authz import FakeAuthz, PolkitDecides
+from harness.fake_authz import FakeAuthz, OwnAuthz
 from harness.modelled_stage import ModelledStage
 from harness.passwords import MARK
 from harness.service import Service
@@ -74,7 +74,7 @@ class Housekeeper(threading.Thread):
     """Gives the tools other manners, and empties what grows around the service."""
 
     def __init__(self, glass: Sandglass, chance: random.Random, stage: SoakedStage, device: Device,
-                 authz: FakeAuthz | PolkitDecides, caller: Caller) -> None:
+                 authz: FakeAuthz | OwnAuthz, caller: Caller) -> None:
         super().__init__()
         self._glass, self._stage, self._device, self._authz = glass, stage, device, authz
         self._caller = caller  # of the tool that is to hang
@@ -120,7 +120,7 @@ class Soak:
     """All that goes on at the same time."""
 
     def __init__(self, stage: SoakedStage, modelled: ModelledStage, device: Device,
-                 authz: FakeAuthz | PolkitDecides, chance: random.Random,
+                 authz: FakeAuthz | OwnAuthz, chance: random.Random,
                  is_with_polkit: bool) -> None:
         self.pid = stage.service.pid
         self._bus = stage.bus
@@ -202,13 +202,13 @@ def held(bus: Bus, pid: int) -> dict[str, int]:
 
 
 @pytest.fixture(params=["allowed", "polkit"])
-def decider(request: pytest.FixtureRequest, authz: FakeAuthz) -> FakeAuthz | PolkitDecides:
-    return PolkitDecides() if request.param == "polkit" else authz
+def decider(request: pytest.FixtureRequest, authz: FakeAuthz) -> FakeAuthz | OwnAuthz:
+    return OwnAuthz() if request.param == "polkit" else authz
 
 
 @pytest.fixture
 def soaked(changing_accounts: AccountFiles, device: Device,
-           start: Callable[..., Service], bus: Bus, decider: FakeAuthz | PolkitDecides,
+           start: Callable[..., Service], bus: Bus, decider: FakeAuthz | OwnAuthz,
            syslog: SyslogSocket, tmp_path: Path) -> Iterator[Stage]:
     """A service with our own stores."""
     stage = SoakedStage(start, bus, decider, syslog, tmp_path, fake_stores=False,
@@ -221,7 +221,7 @@ def soaked(changing_accounts: AccountFiles, device: Device,
 
 
 def test_soak(soaked: SoakedStage, request: pytest.FixtureRequest, accounts: AccountFiles,
-              device: Device, decider: FakeAuthz | PolkitDecides, bus: Bus, amount: int,
+              device: Device, decider: FakeAuthz | OwnAuthz, bus: Bus, amount: int,
               chance: random.Random, figures: Counter) -> None:
     part = request.node.callspec.params["decider"]
     is_with_polkit = part == "polkit"

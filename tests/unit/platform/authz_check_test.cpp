@@ -7,7 +7,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/authz/authz.h"
-#include "platform/authz/polkit_client.h"
+#include "platform/authz/polkit/polkit_client.h"
 #include "tests/unit/platform/child.h"
 #include "tests/unit/platform/outcome.h"
 #include "tests/unit/platform/private_bus.h"

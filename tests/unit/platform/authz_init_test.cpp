@@ -15,7 +15,7 @@
 #include <gtest/gtest.h>
 
 #include "platform/authz/authz.h"
-#include "platform/authz/service_probe.h"
+#include "platform/authz/polkit/service_probe.h"
 #include "tests/unit/platform/child.h"
 #include "tests/unit/platform/outcome.h"
 #include "tests/unit/platform/private_bus.h"

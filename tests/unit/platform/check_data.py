@@ -178,6 +178,40 @@ class ExampleRules(unittest.TestCase):
                          ["g privane-viewer -", "g privane-operator -", "g privane-units -"])
 
 
+class PolicyFiles(unittest.TestCase):
+    def roles_of(self, name):
+        roles = read_ini(DATA / name)
+        return {section: {key: value.split(";") for key, value in roles[section].items()}
+                for section in roles.sections()}
+
+    def test_default_grants_root_alone_everything(self):
+        self.assertEqual(self.roles_of("authz.conf"), {
+            "role root": {"users": ["root"], "actions": [PREFIX + "*"]}})
+
+    def test_example_grants_what_the_rules_do(self):
+        roles = self.roles_of("examples/privane-authz-roles.conf")
+        rules = ExampleRules()
+        units = {f"{PREFIX}{action}.{unit}" for action, unit in (
+            ("reloadservice", "sshd"), ("restartservice", "sshd"),
+            ("startservice", "recorder.any"), ("stopservice", "recorder.any"))}
+        expected = {name: {PREFIX + action for action in rules.granted(name)[0]}
+                    for name in ("viewer", "operator")} | {"units": units}
+        self.assertEqual(roles.pop("role root"), {"users": ["root"], "actions": [PREFIX + "*"]})
+        self.assertEqual({name: role["groups"] for name, role in roles.items()},
+                         {f"role {name}": [f"privane-{name}"] for name in expected})
+        self.assertEqual({name: set(role["actions"]) for name, role in roles.items()},
+                         {f"role {name}": actions for name, actions in expected.items()})
+        for role in roles.values():
+            self.assertEqual(set(role), {"groups", "actions"})
+            self.assertEqual(role["actions"], sorted(set(role["actions"])))
+
+    def test_example_names_what_amounts_to_root(self):
+        text = (DATA / "examples" / "privane-authz-roles.conf").read_text(encoding="utf-8")
+        comment = "\n".join(line for line in text.splitlines() if line.startswith("#"))
+        for name in ROOT_ACTIONS:
+            self.assertIn(name, comment)
+
+
 class BusLimits(unittest.TestCase):
     def test_example_lowers_limits_and_does_nothing_else(self):
         # dbus-daemon(1), those of the system bus.

@@ -1,9 +1,10 @@
-// platform/authz/service_probe.cpp: looks for polkit on the system bus from a short-lived child.
+// platform/authz/polkit/service_probe.cpp: looks for polkit on the system bus from a short-lived
+// child.
 //
 // GDBus does its work in threads, and a thread does not survive the fork of a process that
 // detaches. So GDBus runs in a child, which reports through a pipe: one byte for the verdict, then
 // the text of the error.
-#include "platform/authz/service_probe.h"
+#include "platform/authz/polkit/service_probe.h"
 
 #include <cerrno>
 #include <csignal>
@@ -19,6 +20,7 @@
 #include <gio/gio.h>
 
 #include "platform/authz/authz_error.h"
+#include "platform/authz/polkit/polkit_client.h"
 
 static constexpr char VERDICT_FOUND = '+';
 static constexpr char VERDICT_FAILED = '-';

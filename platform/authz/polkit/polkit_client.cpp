@@ -1,8 +1,9 @@
-// platform/authz/polkit_client.cpp: asks polkit on the process's connection, and words its answers.
+// platform/authz/polkit/polkit_client.cpp: asks polkit on the process's connection, and words its
+// answers.
 //
 // Polkit is asked without its library: that one waits for ever where polkit hangs, and reads an
 // answer of another form as if it were one.
-#include "platform/authz/polkit_client.h"
+#include "platform/authz/polkit/polkit_client.h"
 
 #include <algorithm>
 #include <cstring>
@@ -10,7 +11,7 @@
 #include <gio/gio.h>
 
 #include "platform/authz/authz_error.h"
-#include "platform/authz/unit_action.h"
+#include "platform/authz/polkit/unit_action.h"
 
 static constexpr const char *AUTHORITY_PATH = "/org/freedesktop/PolicyKit1/Authority";
 static constexpr const char *AUTHORITY_INTERFACE = "org.freedesktop.PolicyKit1.Authority";

@@ -1,4 +1,4 @@
-// platform/authz/service_probe.h: whether the authorization service is there; internal.
+// platform/authz/polkit/service_probe.h: whether the authorization service is there; internal.
 #pragma once
 
 #include <glib.h>

@@ -1,7 +1,10 @@
-// platform/authz/polkit_client.h: questions to polkit, each with a deadline; internal.
+// platform/authz/polkit/polkit_client.h: questions to polkit, each with a deadline; internal.
 #pragma once
 
 #include <glib.h>
+
+// Polkit's name on the bus, the service that decides.
+inline constexpr const char *POLKIT_NAME = "org.freedesktop.PolicyKit1";
 
 // True when the owner of the unique bus name may do the action; otherwise *error says why not.
 // Both strings have been checked for their form.

@@ -1,4 +1,5 @@
-// platform/authz/unit_action.h: the actions whose ID ends in the name of a systemd unit; internal.
+// platform/authz/polkit/unit_action.h: the actions whose ID ends in the name of a systemd unit;
+// internal.
 #pragma once
 
 #include <glib.h>

@@ -1,5 +1,5 @@
-// platform/authz/unit_action.cpp: the actions whose ID ends in the name of a systemd unit.
-#include "platform/authz/unit_action.h"
+// platform/authz/polkit/unit_action.cpp: the actions whose ID ends in the name of a systemd unit.
+#include "platform/authz/polkit/unit_action.h"
 
 #include <cstddef>
 #include <cstring>
