@@ -1,10 +1,7 @@
-// platform/authz/polkit/polkit_client.h: questions to polkit, each with a deadline; internal.
+// platform/authz/polkit/polkit_client.h: a check of an action by polkit; internal.
 #pragma once
 
 #include <glib.h>
-
-// Polkit's name on the bus, the service that decides.
-inline constexpr const char *POLKIT_NAME = "org.freedesktop.PolicyKit1";
 
 // True when the owner of the unique bus name may do the action; otherwise *error says why not.
 // Both strings have been checked for their form.

@@ -20,7 +20,7 @@
 #include <gio/gio.h>
 
 #include "platform/authz/authz_error.h"
-#include "platform/authz/polkit/polkit_client.h"
+#include "platform/authz/polkit/polkit_question.h"
 
 static constexpr char VERDICT_FOUND = '+';
 static constexpr char VERDICT_FAILED = '-';
