@@ -1,5 +1,5 @@
-// benchmarks/allow_all.cpp: a libauthz.so.1 that allows everything at once, to see the rest of a
-// call.
+// benchmarks/allow_all/allow_all.cpp: a libauthz.so.1 that allows everything at once, to see the
+// rest of a call.
 #include "platform/authz/authz.h"
 
 #pragma GCC visibility push(default)

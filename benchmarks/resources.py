@@ -1,0 +1,128 @@
+"""benchmarks/resources.py: start-up, memory and sizes (goals 14 to 18, 19a and 25)."""
+import shutil
+import statistics
+import subprocess
+import time
+from pathlib import Path
+
+from benchmarks.account_changes import ADD, REMOVE
+from benchmarks.bus_calls import (ALLOWING_POLICY, GET_USER, LARGE, POLICY_FILE, QUERIES, SMALL, Context,
+                                  Figures)
+from benchmarks.figures import growth_exponents, ratios
+from benchmarks.programs import (BUS_NAME, SERVICE, SERVICE_UNIT, STOCK_DAEMON, STOCK_NAME, STOCK_UNIT,
+                                 loaded_libraries, resident_kib, unit_environment)
+from benchmarks.worlds import World, make_world
+
+# After its name a daemon still has things to do; the memory is read when it has come to rest.
+REST_SECONDS = 1.0
+
+LIBRARIES = ("libauthz", "libbootparam", "libdigestentry", "liblogbackend", "libparamcli", "librtcclock")
+
+
+def median_of(count: int, visit) -> float:
+    return statistics.median(visit() for _ in range(count))
+
+
+def start_times(context: Context) -> Figures:
+    """Goals 14, 15 and 19a."""
+    machine = context.machine
+    starts = context.amounts.starts
+    worlds = {users: make_world(context.memory, users) for users in (25, SMALL, LARGE)}
+
+    def service(users: int):
+        environment = machine.service_environment("polkit")
+        return lambda: median_of(starts, lambda: machine.start_microseconds(
+            worlds[users], BUS_NAME, [SERVICE, "-n"], environment))
+
+    def minimal() -> float:
+        program, name = machine.minimal_command()
+        return median_of(starts, lambda: machine.start_microseconds(
+            worlds[25], name, program, unit_environment(SERVICE_UNIT)))
+
+    def stock() -> float:
+        return machine.start_microseconds(worlds[LARGE], STOCK_NAME, [STOCK_DAEMON],
+                                          unit_environment(STOCK_UNIT))
+
+    times = context.interleave({"few": service(25), "minimal": minimal, "small": service(SMALL),
+                                "large": service(LARGE), "stock": stock})
+    # Loading is what a start with accounts takes beyond a start with next to none: so little with the
+    # fewer that only the medians of all rounds tell it.
+    figures = {"14": ratios(times["few"], times["minimal"]),
+               "15": ratios(times["large"], times["stock"])}
+    few, small, large = (statistics.median(times[name]) for name in ("few", "small", "large"))
+    if small > few:
+        figures["19a"] = growth_exponents([small - few], [large - few], LARGE / SMALL)
+    return figures
+
+
+def memory_at_rest(context: Context) -> Figures:
+    """Goals 16 and 17."""
+    machine = context.machine
+
+    def visit(daemon, world: World):
+        def measured() -> float:
+            with daemon(world) as running:
+                time.sleep(REST_SECONDS)
+                return float(resident_kib(running.pid))
+        return measured
+
+    few, many = make_world(context.memory, 25), make_world(context.memory, LARGE)
+    sizes = context.interleave({
+        "service few": visit(machine.service, few), "minimal": visit(machine.minimal, few),
+        "stock few": visit(machine.stock, few), "service many": visit(machine.service, many),
+        "stock many": visit(machine.stock, many)})
+    return {"16a": ratios(sizes["service few"], sizes["minimal"]),
+            "16b": ratios(sizes["service few"], sizes["stock few"]),
+            "17": ratios(sizes["service many"], sizes["stock many"])}
+
+
+def memory_growth(context: Context) -> Figures:
+    """Goal 18, in one run: growth has no rounds."""
+    machine, amounts = context.machine, context.amounts
+    with machine.service(make_world(context.memory, 25)) as service:
+        def work(calls: int, pairs: int) -> None:
+            for method, arguments in QUERIES.values():
+                machine.microseconds(service, method, arguments, calls=calls // len(QUERIES) + 1)
+            machine.microseconds(service, *ADD, calls=pairs, after=REMOVE)
+            machine.require_alive()
+
+        work(amounts.mixed_calls // 20, amounts.pairs // 20)
+        before = resident_kib(service.pid)
+        work(amounts.mixed_calls, amounts.pairs)
+        return {"18": [float(resident_kib(service.pid) - before)]}
+
+
+def stripped_size(context: Context) -> Figures:
+    """Goal 25a."""
+    files = [Path(SERVICE)]
+    for name in LIBRARIES:
+        found = [path for path in Path("/usr/lib").glob(f"**/{name}.so.1") if path.exists()]
+        if len(found) != 1:
+            raise RuntimeError(f"{name}: {found}")
+        files.append(found[0].resolve())
+    total = 0
+    for file in files:
+        stripped = context.memory / f"{file.name}.stripped"
+        shutil.copyfile(file, stripped)
+        subprocess.run(["strip", stripped], check=True)
+        total += stripped.stat().st_size
+    return {"25a": [total / 1000]}
+
+
+def libraries_with_polkit(context: Context) -> Figures:
+    """Goal 25b: after a call, which may load more."""
+    machine = context.machine
+    with machine.service(make_world(context.memory, 25)) as service:
+        machine.microseconds(service, *GET_USER, calls=1)
+        return {"25b": [float(len(loaded_libraries(service.pid)))]}
+
+
+def libraries_with_policy_file(context: Context) -> Figures:
+    """Goal 25c."""
+    machine, world = context.machine, make_world(context.memory, 25)
+    policy = world.path / POLICY_FILE
+    policy.parent.mkdir(exist_ok=True)
+    policy.write_text(ALLOWING_POLICY)
+    with machine.service(world, "policy_file") as service:
+        machine.microseconds(service, *GET_USER, calls=1)
+        return {"25c": [float(len(loaded_libraries(service.pid)))]}
