@@ -14,6 +14,7 @@ struct internal_user {
     guint32 uid;
     guint32 gid;         // primary group
     gint64 last_change;  // of the password, seconds since the epoch; days above 24855 need 64 bits
+    gsize room;  // bytes behind the record, in which internal_user_copy puts strings; else 0
 };
 
 struct internal_group {
@@ -27,6 +28,13 @@ struct internal_group {
 // Both accept null and half-built records.
 void internal_user_free(internal_user *user);
 void internal_group_free(internal_group *group);
+
+// A copy of the record and its strings. All but the password stand behind it in its own block.
+internal_user *internal_user_copy(const internal_user *user);
+
+// Replaces one of the record's strings but the password; either may be absent.
+void internal_user_replace_text(internal_user *user, char *internal_user::*text,
+                                const char *wanted);
 
 G_DEFINE_AUTOPTR_CLEANUP_FUNC(internal_user, internal_user_free)
 G_DEFINE_AUTOPTR_CLEANUP_FUNC(internal_group, internal_group_free)

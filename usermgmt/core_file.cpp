@@ -43,8 +43,11 @@ gboolean core_file_read_data(const core_file *descriptor, core_file_data *dst_da
         return FALSE;
     }
 
-    wiped_stream_buffer buffer;
+    wiped_read_buffer buffer;
     buffer.give_to(stream);
+    // From here on the stream keeps its position. It would ask the kernel for it twice a line; what
+    // has none fails at its first line.
+    (void)fseek(stream, 0, SEEK_SET);
     g_autoptr(GPtrArray) data = g_ptr_array_new_with_free_func(descriptor->free_record);
     errno = 0;
     while (gpointer record = descriptor->fetch(stream))

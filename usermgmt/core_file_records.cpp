@@ -1,8 +1,9 @@
 // usermgmt/core_file_records.cpp: the lines of the three account files.
 #include "usermgmt/core_file_records.h"
 
+#include <cerrno>
+#include <cstddef>
 #include <cstring>
-#include <type_traits>
 
 #include <grp.h>
 #include <pwd.h>
@@ -10,6 +11,7 @@
 
 #include "usermgmt/account_records.h"
 #include "usermgmt/name_set.h"
+#include "usermgmt/record_block.h"
 #include "usermgmt/secret.h"
 
 static constexpr gint64 SECONDS_PER_DAY = 86400;
@@ -27,69 +29,133 @@ static char *written(const char *text) {
     return const_cast<char *>(text);
 }
 
-// The C library's own copy of a hash is wiped as soon as there is ours: it stays in static storage.
+// Room for the line that is being read, kept to the end of the file. fgetgrent and its like have
+// their own, which grows by a kilobyte and has the line read anew each time: the square of its
+// length, where a group lists every user.
+class line_room {
+  public:
+    constexpr line_room() = default;
+    line_room(const line_room &) = delete;
+    line_room &operator=(const line_room &) = delete;
+
+    char *text() { return text_; }
+    std::size_t size() const { return size_; }
+
+    // Loses the text. False with errno set where there is no memory.
+    bool grow() {
+        const std::size_t size = size_ != 0 ? 2 * size_ : FIRST_SIZE;
+        release();
+        text_ = static_cast<char *>(g_try_malloc(size));
+        if (text_ == nullptr) {
+            errno = ENOMEM;
+            return false;
+        }
+        size_ = size;
+        return true;
+    }
+
+    // Keeps errno.
+    void release() {
+        const int saved_errno = errno;
+        if (text_ != nullptr)
+            explicit_bzero(text_, size_);
+        g_clear_pointer(&text_, g_free);
+        size_ = 0;
+        errno = saved_errno;
+    }
+
+  private:
+    static constexpr std::size_t FIRST_SIZE = 1024;
+
+    char *text_ = nullptr;
+    std::size_t size_ = 0;
+};
+
+template <typename record>
+using line_reader = int (*)(FILE *, record *, char *, std::size_t, record **);
+
+// The stream's next record, whose strings stay until the next call; null at the end of the file,
+// and on a failure, with errno set.
+template <typename record>
+static record *read_line(FILE *stream, line_reader<record> reader) {
+    static line_room room;
+    static record line;
+
+    record *result = nullptr;
+    fpos_t start;
+    if (fgetpos(stream, &start) == 0 && (room.size() != 0 || room.grow()))
+        while (reader(stream, &line, room.text(), room.size(), &result) == ERANGE)
+            if (fsetpos(stream, &start) != 0 || !room.grow())
+                break;
+    if (result == nullptr)
+        room.release();
+    return result;
+}
+
+// A copy of a list of names in one block.
+static char **copy_names(char *const *names) {
+    std::size_t count = 0;
+    std::size_t text_size = 0;
+    for (; names[count] != nullptr; count++)
+        text_size += std::strlen(names[count]) + 1;
+
+    const std::size_t list_size = (count + 1) * sizeof *names;
+    auto **copy = static_cast<char **>(g_malloc(list_size + text_size));
+    char *room = reinterpret_cast<char *>(copy + count + 1);
+    for (std::size_t i = 0; i < count; i++) {
+        copy[i] = room;
+        room = stpcpy(room, names[i]) + 1;
+    }
+    copy[count] = nullptr;
+    return copy;
+}
+
+// The hash in the line's text is wiped as soon as it is copied.
 gpointer fetch_passwd(FILE *stream) {
-    const struct passwd *line = fgetpwent(stream);
+    static constexpr char *passwd::*texts[] = {&passwd::pw_name, &passwd::pw_passwd,
+                                               &passwd::pw_gecos, &passwd::pw_dir,
+                                               &passwd::pw_shell};
+    const struct passwd *line = read_line<struct passwd>(stream, fgetpwent_r);
     if (line == nullptr)
         return nullptr;
-
-    auto *copy = g_new0(struct passwd, 1);
-    copy->pw_name = g_strdup(line->pw_name);
-    copy->pw_passwd = g_strdup(line->pw_passwd);
+    struct passwd *copy = copy_with_texts(line, texts);
     wipe_text(line->pw_passwd);
-    copy->pw_uid = line->pw_uid;
-    copy->pw_gid = line->pw_gid;
-    copy->pw_gecos = g_strdup(line->pw_gecos);
-    copy->pw_dir = g_strdup(line->pw_dir);
-    copy->pw_shell = g_strdup(line->pw_shell);
     return copy;
 }
 
 void free_passwd(gpointer record) {
-    auto *line = static_cast<struct passwd *>(record);
-    if (line == nullptr)
+    if (record == nullptr)
         return;
-    g_free(line->pw_name);
-    wipe_free(line->pw_passwd);
-    g_free(line->pw_gecos);
-    g_free(line->pw_dir);
-    g_free(line->pw_shell);
-    g_free(line);
+    wipe_text(static_cast<struct passwd *>(record)->pw_passwd);
+    g_free(record);
 }
 
 gpointer fetch_shadow(FILE *stream) {
-    const struct spwd *line = fgetspent(stream);
+    static constexpr char *spwd::*texts[] = {&spwd::sp_namp, &spwd::sp_pwdp};
+    const struct spwd *line = read_line<struct spwd>(stream, fgetspent_r);
     if (line == nullptr)
         return nullptr;
-
-    auto *copy = g_new0(struct spwd, 1);
-    *copy = *line;
-    copy->sp_namp = g_strdup(line->sp_namp);
-    copy->sp_pwdp = g_strdup(line->sp_pwdp);
+    struct spwd *copy = copy_with_texts(line, texts);
     wipe_text(line->sp_pwdp);
     return copy;
 }
 
 void free_shadow(gpointer record) {
-    auto *line = static_cast<struct spwd *>(record);
-    if (line == nullptr)
+    if (record == nullptr)
         return;
-    g_free(line->sp_namp);
-    wipe_free(line->sp_pwdp);
-    g_free(line);
+    wipe_text(static_cast<struct spwd *>(record)->sp_pwdp);
+    g_free(record);
 }
 
 gpointer fetch_group(FILE *stream) {
-    const struct group *line = fgetgrent(stream);
+    static constexpr char *group::*texts[] = {&group::gr_name, &group::gr_passwd};
+    const struct group *line = read_line<struct group>(stream, fgetgrent_r);
     if (line == nullptr)
         return nullptr;
-
-    auto *copy = g_new0(struct group, 1);
-    copy->gr_name = g_strdup(line->gr_name);
-    copy->gr_passwd = g_strdup(line->gr_passwd);
+    struct group *copy = copy_with_texts(line, texts);
     wipe_text(line->gr_passwd);
-    copy->gr_gid = line->gr_gid;
-    copy->gr_mem = g_strdupv(line->gr_mem);
+    if (line->gr_mem != nullptr)
+        copy->gr_mem = copy_names(line->gr_mem);
     return copy;
 }
 
@@ -97,9 +163,8 @@ void free_group(gpointer record) {
     auto *line = static_cast<struct group *>(record);
     if (line == nullptr)
         return;
-    g_free(line->gr_name);
-    wipe_free(line->gr_passwd);
-    g_strfreev(line->gr_mem);
+    wipe_text(line->gr_passwd);
+    g_free(line->gr_mem);
     g_free(line);
 }
 

@@ -37,7 +37,7 @@ static internal_group *internal_group_from_linux_group(const struct group *line,
     group->gid = line->gr_gid;
     group->members = member_set_new();
     for (char **member = line->gr_mem; member != nullptr && *member != nullptr; member++)
-        add_user_to_group(group, *member, nullptr);
+        (void)g_hash_table_add(group->members, g_strdup(*member));
     return group;
 }
 
@@ -126,29 +126,56 @@ static GHashTable *gid_index(const usermgmt_ctx *ctx) {
     return index;
 }
 
-// Name -> struct spwd, both borrowed; null without a shadow file. The first line of a name counts.
-static GHashTable *shadow_index(const usermgmt_ctx *ctx) {
-    const core_file_data &cached = ctx->cached[CORE_FILE_ROW_SHADOW];
-    if (cached.data == nullptr)
-        return nullptr;
+// Finds the shadow lines of users who are asked for in the order of the passwd file. As long as the
+// shadow file keeps to it, as our own writing does, the next line is the wanted one and no index is
+// made. The first line of a name counts.
+class shadow_lines {
+  public:
+    // The lines are borrowed; null without a shadow file.
+    explicit shadow_lines(const GPtrArray *lines) : lines_(lines) {}
+    ~shadow_lines() { g_clear_pointer(&index_, g_hash_table_unref); }
+    shadow_lines(const shadow_lines &) = delete;
+    shadow_lines &operator=(const shadow_lines &) = delete;
 
-    GHashTable *index = g_hash_table_new(g_str_hash, g_str_equal);
-    for (struct spwd *line : records<struct spwd>(cached.data))
-        if (!g_hash_table_contains(index, line->sp_namp))
-            (void)g_hash_table_insert(index, line->sp_namp, line);
-    return index;
-}
+    // Null where there is none. New is a name that was not asked for before: the lines that were
+    // passed are then other users'.
+    const struct spwd *find(const char *name, bool is_new) {
+        if (lines_ == nullptr)
+            return nullptr;
+        if (index_ == nullptr && is_new && next_ < lines_->len) {
+            const struct spwd *line = line_at(next_);
+            if (g_str_equal(line->sp_namp, name)) {
+                next_++;
+                return line;
+            }
+        }
+        if (index_ == nullptr)
+            make_index();
+        return static_cast<const struct spwd *>(g_hash_table_lookup(index_, name));
+    }
 
-static const struct spwd *find_shadow(GHashTable *shadow, const char *name) {
-    if (shadow == nullptr)
-        return nullptr;
-    return static_cast<const struct spwd *>(g_hash_table_lookup(shadow, name));
-}
+  private:
+    struct spwd *line_at(guint i) const {
+        return static_cast<struct spwd *>(g_ptr_array_index(lines_, i));
+    }
 
-static internal_user *internal_user_from_linux_passwd(const struct passwd *line, GHashTable *shadow,
-                                                      GHashTable *gids, GError **error) {
+    // Name -> line, both borrowed; from the last line on, so that the first of a name stays.
+    void make_index() {
+        index_ = g_hash_table_new(g_str_hash, g_str_equal);
+        for (guint i = lines_->len; i > 0; i--)
+            (void)g_hash_table_insert(index_, line_at(i - 1)->sp_namp, line_at(i - 1));
+    }
+
+    const GPtrArray *lines_;
+    guint next_ = 0;
+    GHashTable *index_ = nullptr;
+};
+
+static internal_user *internal_user_from_linux_passwd(const struct passwd *line, bool is_new,
+                                                      shadow_lines *shadow, GHashTable *gids,
+                                                      GError **error) {
     const bool shadowed = g_strcmp0(line->pw_passwd, password_elsewhere) == 0;
-    const struct spwd *shadow_line = shadowed ? find_shadow(shadow, line->pw_name) : nullptr;
+    const struct spwd *shadow_line = shadowed ? shadow->find(line->pw_name, is_new) : nullptr;
     if (shadowed && shadow_line == nullptr) {
         g_set_error(error, USERMGMT_ERROR, USERMGMT_ERROR_USER,
                     "no corresponding shadow entry was found for '%s'", line->pw_name);
@@ -167,19 +194,20 @@ static internal_user *internal_user_from_linux_passwd(const struct passwd *line,
         return nullptr;
     }
 
-    auto *user = g_new0(internal_user, 1);
-    user->type = type;
-    user->shadowed = shadowed;
-    user->name = g_strdup(line->pw_name);
-    user->password = g_strdup(shadowed ? shadow_line->sp_pwdp : line->pw_passwd);
-    user->gecos = g_strdup(line->pw_gecos);
-    user->home = g_strdup(line->pw_dir);
-    user->shell = g_strdup(line->pw_shell);
-    user->uid = line->pw_uid;
-    user->gid = line->pw_gid;
-    if (shadowed)
-        user->last_change = gint64{shadow_line->sp_lstchg} * SECONDS_PER_DAY;
-    return user;
+    const internal_user borrowed = {
+        .type = type,
+        .shadowed = shadowed ? TRUE : FALSE,
+        .name = line->pw_name,
+        .password = shadowed ? shadow_line->sp_pwdp : line->pw_passwd,
+        .gecos = line->pw_gecos,
+        .home = line->pw_dir,
+        .shell = line->pw_shell,
+        .uid = line->pw_uid,
+        .gid = line->pw_gid,
+        .last_change = shadowed ? gint64{shadow_line->sp_lstchg} * SECONDS_PER_DAY : 0,
+        .room = 0,
+    };
+    return internal_user_copy(&borrowed);
 }
 
 gboolean init_populate_user_database(const usermgmt_ctx *ctx, user_database *user_db,
@@ -194,14 +222,17 @@ gboolean init_populate_user_database(const usermgmt_ctx *ctx, user_database *use
     if (cached.data == nullptr)
         return TRUE;
     g_autoptr(GHashTable) gids = gid_index(ctx);
-    g_autoptr(GHashTable) shadow = shadow_index(ctx);
+    shadow_lines shadow(ctx->cached[CORE_FILE_ROW_SHADOW].data);
+    bool all_loaded = true;
     for (const struct passwd *line : records<const struct passwd>(cached.data)) {
         g_autoptr(GError) cause = nullptr;
-        internal_user *user = internal_user_from_linux_passwd(line, shadow, gids, &cause);
+        const bool is_new = all_loaded && user_database_find(user_db, line->pw_name) == nullptr;
+        internal_user *user = internal_user_from_linux_passwd(line, is_new, &shadow, gids, &cause);
         if (user != nullptr) {
             user_database_add(user_db, user);
             continue;
         }
+        all_loaded = false;
         syslog(LOG_WARNING, "Failed to parse user '%s': %s", line->pw_name, text_of(cause));
         if ((ctx->open_flags & USERMGMT_OPEN_STRICT) != 0) {
             g_propagate_prefixed_error(error, g_steal_pointer(&cause),
@@ -247,7 +278,8 @@ static GHashTable *passwd_names(const usermgmt_ctx *ctx) {
 }
 
 void warn_of_unknown_members(const usermgmt_ctx *ctx) {
-    g_autoptr(GHashTable) names = passwd_names(ctx);
+    // Also of those that were skipped at load; where every member was loaded it is not needed.
+    g_autoptr(GHashTable) names = nullptr;
     for (const internal_group *group : records<const internal_group>(ctx->group_db.entries)) {
         const char *first = nullptr;
         guint count = 0;
@@ -255,6 +287,10 @@ void warn_of_unknown_members(const usermgmt_ctx *ctx) {
         gpointer member;
         g_hash_table_iter_init(&iter, group->members);
         while (g_hash_table_iter_next(&iter, &member, nullptr)) {
+            if (g_hash_table_contains(ctx->user_db.name_hash, member))
+                continue;
+            if (names == nullptr)
+                names = passwd_names(ctx);
             if (g_hash_table_contains(names, member))
                 continue;
             first = static_cast<const char *>(member);

@@ -1,6 +1,7 @@
 // usermgmt/secret.h: memory that is wiped before it is freed, internal to usermgmt.
 #pragma once
 
+#include <cstddef>
 #include <cstdio>
 #include <cstring>
 
@@ -23,16 +24,22 @@ G_DEFINE_AUTO_CLEANUP_FREE_FUNC(secret_string, wipe_free, nullptr)
 
 // The buffer of a stream that carries secrets; the stream's own would be freed as it is. It must
 // outlive the stream.
-class wiped_stream_buffer {
+template <std::size_t size>
+class wiped_stream_buffer_of {
   public:
-    wiped_stream_buffer() = default;
-    ~wiped_stream_buffer() { explicit_bzero(bytes_, sizeof bytes_); }
-    wiped_stream_buffer(const wiped_stream_buffer &) = delete;
-    wiped_stream_buffer &operator=(const wiped_stream_buffer &) = delete;
+    wiped_stream_buffer_of() = default;
+    ~wiped_stream_buffer_of() { explicit_bzero(bytes_, sizeof bytes_); }
+    wiped_stream_buffer_of(const wiped_stream_buffer_of &) = delete;
+    wiped_stream_buffer_of &operator=(const wiped_stream_buffer_of &) = delete;
 
     // Right after the stream was opened.
     void give_to(FILE *stream) { (void)setvbuf(stream, bytes_, _IOFBF, sizeof bytes_); }
 
   private:
-    char bytes_[4096] = {};
+    char bytes_[size] = {};
 };
+
+// As large as the C library would make it.
+using wiped_stream_buffer = wiped_stream_buffer_of<4096>;
+// For a whole file, of any size.
+using wiped_read_buffer = wiped_stream_buffer_of<std::size_t{32} * 1024>;

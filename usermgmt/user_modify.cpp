@@ -226,11 +226,11 @@ static bool modify_secondary_groups(modification &change, GError **error) {
 }
 
 // An empty text is a value like any other.
-static void replace_text(char **text, const char *wanted, gboolean *changed) {
-    if (g_strcmp0(*text, wanted) == 0)
+static void replace_text(internal_user *user, char *internal_user::*text, const char *wanted,
+                         gboolean *changed) {
+    if (g_strcmp0(user->*text, wanted) == 0)
         return;
-    g_free(*text);
-    *text = g_strdup(wanted);
+    internal_user_replace_text(user, text, wanted);
     *changed = TRUE;
 }
 
@@ -247,9 +247,9 @@ static bool change_fields(modification &change, GError **error) {
                                     error))
         return false;
     if (is_wanted(change, USER_FIELD_GECOS))
-        replace_text(&user->gecos, change.wanted->gecos, dirty);
+        replace_text(user, &internal_user::gecos, change.wanted->gecos, dirty);
     if (is_wanted(change, USER_FIELD_SHELL))
-        replace_text(&user->shell, change.wanted->shell, dirty);
+        replace_text(user, &internal_user::shell, change.wanted->shell, dirty);
     return usermgmt_sync(change.ctx, error);
 }
 

@@ -6,7 +6,6 @@ import pytest
 from harness.accounts import AccountFiles
 from harness.bus import Bus, domain_error, error_of
 from harness.fake_authz import FakeAuthz
-from harness.sandbox import fake_library
 from harness.service import Service
 from harness.service_fixtures import StartService
 
@@ -40,9 +39,9 @@ def start_on(accounts: AccountFiles, start: StartService, authz: FakeAuthz,
     """Starts the service on the given files, which the test must leave alive."""
     services = []
 
-    def start_service(passwd: str, group: str, **environment: str) -> Service:
+    def start_service(passwd: str, group: str) -> Service:
         accounts.write_exactly(passwd, "", group)
-        services.append(start(environment={**authz.environment(), **environment}))
+        services.append(start(environment=authz.environment()))
         services[-1].wait_registered(bus)
         return services[-1]
     yield start_service
@@ -66,7 +65,7 @@ def assert_too_large(service: Service, bus: Bus, member: str, *arguments: str) -
 
 def test_members_of_one_group_that_are_too_large(start_on: Start, bus: Bus) -> None:
     group = f"root:x:0:\nusers:x:100:{','.join(names('m', 33 << 20))}\nstaff:x:50:alice\n"
-    service = start_on("", group, LD_PRELOAD=str(fake_library("long_lines/liblonglines.so")))
+    service = start_on("", group)
 
     assert_too_large(service, bus, "GetGroup", "users")
     assert_too_large(service, bus, "GetGroupListFull")

@@ -34,6 +34,62 @@ TEST(AccountRecords, UserPasswordIsWipedBeforeItIsFreed) {
     EXPECT_EQ(watch.readable(), lines());
 }
 
+TEST(AccountRecords, CopyOfAUserKeepsEveryField) {
+    internal_user *user = new_user({.name = "alice", .password = "$5$salt$secrethash"});
+    const internal_user original = *user;
+    g_autoptr(internal_user) copy = internal_user_copy(user);
+    EXPECT_NE(copy->name, original.name);
+    EXPECT_NE(copy->password, original.password);
+    EXPECT_STREQ(copy->name, user->name);
+    EXPECT_STREQ(copy->password, user->password);
+    EXPECT_STREQ(copy->gecos, user->gecos);
+    EXPECT_STREQ(copy->home, user->home);
+    EXPECT_STREQ(copy->shell, user->shell);
+    EXPECT_EQ(copy->uid, user->uid);
+    EXPECT_EQ(copy->gid, user->gid);
+    EXPECT_EQ(copy->last_change, user->last_change);
+    internal_user_free(user);
+    EXPECT_STREQ(copy->name, "alice");
+}
+
+TEST(AccountRecords, CopyOfAnEmptyUserIsEmpty) {
+    const internal_user empty = {};
+    g_autoptr(internal_user) copy = internal_user_copy(&empty);
+    EXPECT_EQ(copy->name, nullptr);
+    EXPECT_EQ(copy->password, nullptr);
+    EXPECT_EQ(copy->gecos, nullptr);
+    EXPECT_EQ(copy->home, nullptr);
+    EXPECT_EQ(copy->shell, nullptr);
+}
+
+// In the block of the record, in one of its own, and absent, one after the other.
+TEST(AccountRecords, TextsAreReplacedWhereverTheyStand) {
+    internal_user *user = new_user({.name = "alice"});
+    g_autoptr(internal_user) copy = internal_user_copy(user);
+    internal_user_free(user);
+    for (char *internal_user::*text :
+         {&internal_user::name, &internal_user::gecos, &internal_user::home, &internal_user::shell})
+        for (const char *wanted : {"longer than what stood there before", "", "x"}) {
+            internal_user_replace_text(copy, text, wanted);
+            EXPECT_STREQ(copy->*text, wanted);
+        }
+    internal_user_replace_text(copy, &internal_user::gecos, nullptr);
+    EXPECT_EQ(copy->gecos, nullptr);
+    EXPECT_STREQ(copy->shell, "x");
+}
+
+TEST(AccountRecords, PasswordOfACopyIsWipedBeforeItIsFreed) {
+    secret_watch watch;
+    internal_user *user = new_user({.name = "alice", .password = "$5$salt$secrethash"});
+    internal_user *copy = internal_user_copy(user);
+    watch.add(user->password);
+    watch.add(copy->password);
+    internal_user_free(user);
+    internal_user_free(copy);
+    EXPECT_EQ(watch.wiped(), 2);
+    EXPECT_EQ(watch.readable(), lines());
+}
+
 TEST(AccountRecords, GroupPasswordIsWipedBeforeItIsFreed) {
     secret_watch watch;
     internal_group *group = new_group({.name = "video", .password = "$5$salt$secrethash"});

@@ -16,43 +16,60 @@ reread_lines::~reread_lines() {
     active = nullptr;
 }
 
-// The last record's strings are still in the C library's buffer at the end of a file.
+// The last record's strings are still in the reader's room at the end of a file.
 template <typename record>
-record *reread_lines::pass_on(record *line, record *last,
-                              const std::function<void(record *)> &alter) {
-    if (line == nullptr)
-        return repeat_last && std::exchange(has_last_, false) ? last : nullptr;
-    *last = *line;
-    has_last_ = true;
-    if (alter)
-        alter(line);
-    return line;
+int reread_lines::pass_on(int error, record *line, record **result, record *last,
+                          const std::function<void(record *)> &alter) {
+    calls++;
+    if (error == 0) {
+        *last = *line;
+        has_last_ = true;
+        if (alter)
+            alter(line);
+    } else if (error == ENOENT && repeat_last && std::exchange(has_last_, false)) {
+        *line = *last;
+        *result = line;
+        return 0;
+    }
+    return error;
 }
 
 // The linker sends the calls here (--wrap).
 
-struct passwd *real_fgetpwent(FILE *stream) asm("__real_fgetpwent");
-struct passwd *wrap_fgetpwent(FILE *stream) asm("__wrap_fgetpwent");
-struct passwd *wrap_fgetpwent(FILE *stream) {
+int real_fgetpwent_r(FILE *stream, struct passwd *line, char *room, size_t size,
+                     struct passwd **result) asm("__real_fgetpwent_r");
+int wrap_fgetpwent_r(FILE *stream, struct passwd *line, char *room, size_t size,
+                     struct passwd **result) asm("__wrap_fgetpwent_r");
+int wrap_fgetpwent_r(FILE *stream, struct passwd *line, char *room, size_t size,
+                     struct passwd **result) {
     static struct passwd last;
-    struct passwd *line = real_fgetpwent(stream);
-    return active != nullptr ? active->pass_on(line, &last, active->on_passwd) : line;
+    const int error = real_fgetpwent_r(stream, line, room, size, result);
+    return active != nullptr ? active->pass_on(error, line, result, &last, active->on_passwd)
+                             : error;
 }
 
-struct spwd *real_fgetspent(FILE *stream) asm("__real_fgetspent");
-struct spwd *wrap_fgetspent(FILE *stream) asm("__wrap_fgetspent");
-struct spwd *wrap_fgetspent(FILE *stream) {
+int real_fgetspent_r(FILE *stream, struct spwd *line, char *room, size_t size,
+                     struct spwd **result) asm("__real_fgetspent_r");
+int wrap_fgetspent_r(FILE *stream, struct spwd *line, char *room, size_t size,
+                     struct spwd **result) asm("__wrap_fgetspent_r");
+int wrap_fgetspent_r(FILE *stream, struct spwd *line, char *room, size_t size,
+                     struct spwd **result) {
     static struct spwd last;
-    struct spwd *line = real_fgetspent(stream);
-    return active != nullptr ? active->pass_on(line, &last, active->on_shadow) : line;
+    const int error = real_fgetspent_r(stream, line, room, size, result);
+    return active != nullptr ? active->pass_on(error, line, result, &last, active->on_shadow)
+                             : error;
 }
 
-struct group *real_fgetgrent(FILE *stream) asm("__real_fgetgrent");
-struct group *wrap_fgetgrent(FILE *stream) asm("__wrap_fgetgrent");
-struct group *wrap_fgetgrent(FILE *stream) {
+int real_fgetgrent_r(FILE *stream, struct group *line, char *room, size_t size,
+                     struct group **result) asm("__real_fgetgrent_r");
+int wrap_fgetgrent_r(FILE *stream, struct group *line, char *room, size_t size,
+                     struct group **result) asm("__wrap_fgetgrent_r");
+int wrap_fgetgrent_r(FILE *stream, struct group *line, char *room, size_t size,
+                     struct group **result) {
     static struct group last;
-    struct group *line = real_fgetgrent(stream);
-    return active != nullptr ? active->pass_on(line, &last, active->on_group) : line;
+    const int error = real_fgetgrent_r(stream, line, room, size, result);
+    return active != nullptr ? active->pass_on(error, line, result, &last, active->on_group)
+                             : error;
 }
 
 FILE *real_fopencookie(void *cookie, const char *mode,

@@ -26,13 +26,17 @@ class reread_lines {
     // The last record of a file comes twice.
     bool repeat_last = false;
 
+    // How often the C library was asked for a line.
+    int calls = 0;
+
     // Error numbers; 0 lets the call through.
     int write_stream_error = 0;
     int read_stream_error = 0;
 
-    // For the wrapped calls: the record to answer instead of the end of the file.
+    // For the wrapped calls: what to answer, given the C library's answer.
     template <typename record>
-    record *pass_on(record *line, record *last, const std::function<void(record *)> &alter);
+    int pass_on(int error, record *line, record **result, record *last,
+                const std::function<void(record *)> &alter);
 
   private:
     bool has_last_ = false;

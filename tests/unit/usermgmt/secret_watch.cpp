@@ -2,6 +2,9 @@
 #include "tests/unit/usermgmt/secret_watch.h"
 
 #include <cstring>
+#include <functional>
+
+#include <malloc.h>
 
 #include <glib.h>
 
@@ -30,8 +33,11 @@ void secret_watch::add(const char *secret) {
 }
 
 void secret_watch::on_free(const void *memory) {
+    // A secret may stand anywhere in the block.
+    const auto *block = static_cast<const char *>(memory);
+    const char *end = block + malloc_usable_size(const_cast<void *>(memory));
     for (const watched &secret : watched_) {
-        if (secret.memory != memory)
+        if (std::less<>()(secret.memory, block) || !std::less<>()(secret.memory, end))
             continue;
         const std::string held(secret.memory, secret.size);
         if (held == std::string(secret.size, '\0'))

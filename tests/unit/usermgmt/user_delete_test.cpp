@@ -151,7 +151,7 @@ TEST_F(UserDelete, WithoutGroupsTheDeletionGoesOn) {
 }
 
 TEST_F(UserDelete, RecordWithoutNameIsRemovedAllTheSame) {
-    g_clear_pointer(&user("alice")->name, g_free);
+    internal_user_replace_text(user("alice"), &internal_user::name, nullptr);
     EXPECT_EQ(glib_log_of([this] { EXPECT_EQ(delete_user("alice"), ""); }),
               lines{"usermgmt-CRITICAL: remove_user_from_all_groups: assertion 'username != NULL' "
                     "failed"});
