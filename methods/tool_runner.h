@@ -33,5 +33,10 @@ G_DEFINE_AUTO_CLEANUP_CLEAR_FUNC(tool_result, tool_result_clear)
 // status at -1, when it could not be started. The vector ends with a null.
 bool run_tool(const char *const *argv, tool_capture capture, tool_result *result, GError **error);
 
+// The same with tool_capture::OUTPUT, in a time that does not grow with the service's memory. The
+// tool then ignores SIGPIPE, as the service does. A tool that cannot be started so is tried once
+// more by run_tool, whose error tells why.
+bool run_tool_without_fork(const char *const *argv, tool_result *result, GError **error);
+
 // Whether the tool ended by itself, with status 0.
 bool tool_succeeded(const tool_result &result);

@@ -49,7 +49,7 @@ static pid_t find_cfgstore() {
     const char *const argv[] = {PIDOF, CFGSTORE, nullptr};
     g_auto(tool_result) result = {};
     g_autoptr(GError) error = nullptr;
-    if (!run_tool(argv, tool_capture::OUTPUT, &result, &error)) {
+    if (!run_tool_without_fork(argv, &result, &error)) {
         syslog(LOG_ERR, "Could not get PID for '%s': %s", CFGSTORE,
                error != nullptr ? error->message : "Unknown error");
         return 0;

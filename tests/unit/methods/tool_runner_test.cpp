@@ -6,6 +6,7 @@
 #include <string>
 
 #include <fcntl.h>
+#include <pthread.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -22,6 +23,11 @@ class ToolRunner : public testing::Test {
         tool_result_clear(&result_);
         const char *const argv[] = {"/bin/sh", "-c", script, "sh", "a b", "$(c)", "", nullptr};
         return run_tool(argv, capture, &result_, &error_);
+    }
+    bool run_script_without_fork(const char *script) {
+        tool_result_clear(&result_);
+        const char *const argv[] = {"/bin/sh", "-c", script, "sh", "a b", "$(c)", "", nullptr};
+        return run_tool_without_fork(argv, &result_, &error_);
     }
     static std::string text(const char *captured) {
         return captured != nullptr ? captured : "none";
@@ -99,17 +105,65 @@ TEST_F(ToolRunner, PathIsNotSearched) {
     EXPECT_TRUE(g_error_matches(error_, G_SPAWN_ERROR, G_SPAWN_ERROR_NOENT));
 }
 
+static int forks;
+
+static void count_fork() {
+    forks++;
+}
+
+// The handlers of pthread_atfork run for fork alone.
+TEST_F(ToolRunner, WithoutForkThereIsNone) {
+    ASSERT_EQ(pthread_atfork(count_fork, nullptr, nullptr), 0);
+    forks = 0;
+    EXPECT_TRUE(run_script("echo forked", tool_capture::OUTPUT));
+    EXPECT_EQ(forks, 1);
+    EXPECT_TRUE(run_script_without_fork("echo spawned"));
+    EXPECT_EQ(forks, 1);
+    EXPECT_EQ(output(), "spawned\n");
+}
+
+TEST_F(ToolRunner, WithoutForkTheOutcomeIsTheSame) {
+    testing::internal::CaptureStderr();
+    EXPECT_TRUE(run_script_without_fork("printf '<%s>' \"$@\"; echo err >&2; exit 3"));
+    EXPECT_EQ(testing::internal::GetCapturedStderr(), "err\n");
+    EXPECT_EQ(output() + error_output(), "<a b><$(c)><>none");
+    EXPECT_EQ(result_.wait_status, 3 << 8);
+}
+
+TEST_F(ToolRunner, WithoutForkTheErrorIsTheSame) {
+    for (const char *program : {"/nonexistent/tool", "/etc/passwd", "sh"}) {
+        const char *const argv[] = {program, nullptr};
+        g_autoptr(GError) forked = nullptr;
+        EXPECT_FALSE(run_tool(argv, tool_capture::OUTPUT, &result_, &forked)) << program;
+        g_autoptr(GError) spawned = nullptr;
+        EXPECT_FALSE(run_tool_without_fork(argv, &result_, &spawned)) << program;
+
+        EXPECT_TRUE(g_error_matches(spawned, forked->domain, forked->code)) << program;
+        EXPECT_STREQ(spawned->message, forked->message);
+        EXPECT_EQ(output(), "none") << program;
+        EXPECT_EQ(result_.wait_status, -1) << program;
+    }
+}
+
 TEST_F(ToolRunner, EnvironmentIsInheritedAndDescriptorsAreNot) {
     const int open_here = open("/dev/null", O_RDONLY);
     ASSERT_GT(open_here, 2);
     ASSERT_EQ(setenv("TOOL_RUNNER_TEST", "inherited", 1), 0);
 
-    EXPECT_TRUE(
-        run_script("echo $TOOL_RUNNER_TEST; readlink /proc/self/fd/0; cd /proc/$$/fd; "
-                   "for fd in *; do [ $fd -gt 2 ] && [ -e $fd ] && readlink $fd; done",
-                   tool_capture::OUTPUT));
-    EXPECT_EQ(output().substr(0, output().find("/dev/null") + 10), "inherited\n/dev/null\n");
-    EXPECT_EQ(output().find("/dev/null", output().find("/dev/null") + 1), std::string::npos);
+    static constexpr const char *script =
+        "echo $TOOL_RUNNER_TEST; readlink /proc/self/fd/0; cd /proc/$$/fd; "
+        "for fd in *; do [ $fd -gt 2 ] && [ -e $fd ] && readlink $fd; done";
+    const auto expect_null_input_alone = [this] {
+        EXPECT_EQ(output().substr(0, output().find("/dev/null") + 10), "inherited\n/dev/null\n");
+        EXPECT_EQ(output().find("/dev/null", output().find("/dev/null") + 1), std::string::npos);
+    };
+
+    EXPECT_TRUE(run_script(script, tool_capture::OUTPUT));
+    expect_null_input_alone();
+    // The second time it would not be open for the tool any more.
+    EXPECT_EQ(fcntl(open_here, F_GETFD), 0);
+    EXPECT_TRUE(run_script_without_fork(script));
+    expect_null_input_alone();
     (void)unsetenv("TOOL_RUNNER_TEST");
     (void)close(open_here);
 }
