@@ -17,12 +17,14 @@ char *sendable_text(const char *text) {
     return text != nullptr ? g_utf8_make_valid(text, -1) : g_strdup("");
 }
 
-char **sendable_list(const char *const *list) {
-    const guint length = g_strv_length(const_cast<char **>(list));
-    char **sendable = g_new0(char *, length + 1);
-    for (guint i = 0; i < length; i++)
-        sendable[i] = sendable_text(list[i]);
-    return sendable;
+void make_sendable(char **list) {
+    for (; *list != nullptr; list++) {
+        if (g_utf8_validate(*list, -1, nullptr))
+            continue;
+        char *sendable = g_utf8_make_valid(*list, -1);
+        g_free(*list);
+        *list = sendable;
+    }
 }
 
 gsize wire_size(const char *text) {

@@ -8,7 +8,9 @@
 
 // A copy in valid UTF-8, each invalid byte replaced by U+FFFD; "" for null. Owned by the caller.
 char *sendable_text(const char *text);
-char **sendable_list(const char *const *list);
+
+// The same for each string of a list, in its place: lists are long, and nearly all of it is valid.
+void make_sendable(char **list);
 
 // Bytes that a string, or an array of strings, takes in a message at most.
 gsize wire_size(const char *text);

@@ -58,8 +58,8 @@ bool handle_get_digest_list(method_call &call) {
         // Deliberate: no separator between the two texts.
         return pass_on(call, "Could not open HTTP digest file");
 
-    g_auto(GStrv) names = user_names_of(text);
-    g_auto(GStrv) users = sendable_list(names);
+    g_auto(GStrv) users = user_names_of(text);
+    make_sendable(users);
     if (!check_reply_size(wire_size(users), &call.error))
         return pass_on(call, "");
 

@@ -30,22 +30,22 @@ bool handle_get_user(method_call &call, const char *user) {
         return pass_on(call, "");
 
     g_autofree char *group = sendable_text(entry.group);
-    g_auto(GStrv) groups = sendable_list(entry.groups);
+    make_sendable(entry.groups);
     g_autofree char *comment = sendable_text(entry.gecos);
-    if (!fits(call, wire_size(group) + wire_size(groups) + wire_size(comment)))
+    if (!fits(call, wire_size(group) + wire_size(entry.groups) + wire_size(comment)))
         return false;
 
     privane_system__complete_get_user(call.skeleton, call.invocation, entry.password != nullptr,
-                                      group, groups, comment, entry.uid);
+                                      group, entry.groups, comment, entry.uid);
     return true;
 }
 
 bool handle_get_user_list(method_call &call) {
-    g_auto(GStrv) names = nullptr;
-    if (!usermgmt_get_all_users(call.state->usermgmt_context, &names, nullptr, &call.error))
+    g_auto(GStrv) users = nullptr;
+    if (!usermgmt_get_all_users(call.state->usermgmt_context, &users, nullptr, &call.error))
         return pass_on(call, "");
 
-    g_auto(GStrv) users = sendable_list(names);
+    make_sendable(users);
     if (!fits(call, wire_size(users)))
         return false;
 
@@ -55,11 +55,11 @@ bool handle_get_user_list(method_call &call) {
 
 bool handle_get_group(method_call &call, const char *group) {
     guint32 gid = 0;
-    g_auto(GStrv) names = nullptr;
-    if (!usermgmt_get_group(call.state->usermgmt_context, group, &gid, &names, &call.error))
+    g_auto(GStrv) members = nullptr;
+    if (!usermgmt_get_group(call.state->usermgmt_context, group, &gid, &members, &call.error))
         return pass_on(call, "");
 
-    g_auto(GStrv) members = sendable_list(names);
+    make_sendable(members);
     if (!fits(call, wire_size(members)))
         return false;
 
@@ -69,11 +69,11 @@ bool handle_get_group(method_call &call, const char *group) {
 }
 
 bool handle_get_group_list(method_call &call) {
-    g_auto(GStrv) names = nullptr;
-    if (!usermgmt_get_all_groups(call.state->usermgmt_context, &names, &call.error))
+    g_auto(GStrv) groups = nullptr;
+    if (!usermgmt_get_all_groups(call.state->usermgmt_context, &groups, &call.error))
         return pass_on(call, "");
 
-    g_auto(GStrv) groups = sendable_list(names);
+    make_sendable(groups);
     if (!fits(call, wire_size(groups)))
         return false;
 
@@ -85,11 +85,11 @@ bool handle_get_group_list(method_call &call) {
 static bool add_group(method_call &call, const char *name, GVariantBuilder *gids,
                       GVariantBuilder *member_lists, gsize *size) {
     guint32 gid = static_cast<guint32>(-1);
-    g_auto(GStrv) names = nullptr;
-    if (!usermgmt_get_group(call.state->usermgmt_context, name, &gid, &names, &call.error))
+    g_auto(GStrv) members = nullptr;
+    if (!usermgmt_get_group(call.state->usermgmt_context, name, &gid, &members, &call.error))
         return false;
 
-    g_auto(GStrv) members = sendable_list(names);
+    make_sendable(members);
     g_variant_builder_add(gids, "i", static_cast<int>(gid));
     g_variant_builder_add(member_lists, "^as", members);
     *size += sizeof gid + wire_size(members);
@@ -97,20 +97,20 @@ static bool add_group(method_call &call, const char *name, GVariantBuilder *gids
 }
 
 bool handle_get_group_list_full(method_call &call) {
-    g_auto(GStrv) names = nullptr;
-    if (!usermgmt_get_all_groups(call.state->usermgmt_context, &names, &call.error))
+    g_auto(GStrv) groups = nullptr;
+    if (!usermgmt_get_all_groups(call.state->usermgmt_context, &groups, &call.error))
         return pass_on(call, "");
 
     g_auto(GVariantBuilder) gids = G_VARIANT_BUILDER_INIT(G_VARIANT_TYPE("ai"));
     g_auto(GVariantBuilder) member_lists = G_VARIANT_BUILDER_INIT(G_VARIANT_TYPE("aas"));
     gsize size = 0;
-    for (int k = 0; names[k] != nullptr; k++) {
-        if (!add_group(call, names[k], &gids, &member_lists, &size)) {
+    for (int k = 0; groups[k] != nullptr; k++) {
+        if (!add_group(call, groups[k], &gids, &member_lists, &size)) {
             g_autofree char *prefix = g_strdup_printf("Unable to get group entry #%d: ", k);
             return pass_on(call, prefix);
         }
     }
-    g_auto(GStrv) groups = sendable_list(names);
+    make_sendable(groups);
     if (!fits(call, size + wire_size(groups)))
         return false;
 

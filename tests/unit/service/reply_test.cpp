@@ -40,21 +40,23 @@ TEST(Reply, InvalidBytesAreReplacedOneByOne) {
     }
 }
 
-TEST(Reply, ListIsCopiedElementByElement) {
-    static constexpr const char *raw[] = {"plain", "J\xf6rg", "", nullptr};
-    g_auto(GStrv) sendable = sendable_list(raw);
-    ASSERT_EQ(g_strv_length(sendable), 3U);
-    EXPECT_STREQ(sendable[0], "plain");
-    EXPECT_NE(sendable[0], raw[0]);
-    EXPECT_STREQ(sendable[1], "J\xef\xbf\xbdrg");
-    EXPECT_STREQ(sendable[2], "");
+TEST(Reply, ListIsMadeSendableElementByElement) {
+    static constexpr const char *raw[] = {"plain", "J\xf6rg", "", "\xff", nullptr};
+    g_auto(GStrv) list = g_strdupv(const_cast<char **>(raw));
+    const char *const plain = list[0];
+    make_sendable(list);
+    ASSERT_EQ(g_strv_length(list), 4U);
+    EXPECT_STREQ(list[0], "plain");
+    EXPECT_EQ(list[0], plain);
+    EXPECT_STREQ(list[1], "J\xef\xbf\xbdrg");
+    EXPECT_STREQ(list[2], "");
+    EXPECT_STREQ(list[3], "\xef\xbf\xbd");
 }
 
 TEST(Reply, EmptyListStaysAnEmptyList) {
-    static constexpr const char *none[] = {nullptr};
-    g_auto(GStrv) sendable = sendable_list(none);
-    ASSERT_NE(sendable, nullptr);
-    EXPECT_EQ(sendable[0], nullptr);
+    char *none[] = {nullptr};
+    make_sendable(none);
+    EXPECT_EQ(none[0], nullptr);
 }
 
 // Bytes of the body that GDBus makes of a value: the message says so itself.
