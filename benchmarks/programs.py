@@ -191,12 +191,15 @@ class Machine:
     def microseconds(self, daemon: Daemon, method: str, arguments: str, **options) -> float:
         return float(self.call_times(daemon, method, arguments, **options))
 
-    def start_microseconds(self, world: World, name: str, command: list[str],
-                           environment: dict[str, str]) -> float:
-        """From the fork of a daemon to its name; the world is entered before."""
+    def start_times(self, world: World, name: str, command: list[str],
+                    environment: dict[str, str]) -> tuple[float, float]:
+        """Microseconds from the fork of a daemon to its name, and its processor time in them; the
+        world is entered before."""
         if self.ask_bus("NameHasOwner", name):
             raise RuntimeError(f"{name} is owned already")
-        return float(run(world.command(self.program("start_time"), name, *command), env=environment))
+        elapsed, worked = run(world.command(self.program("start_time"), name, *command),
+                              env=environment).split()
+        return float(elapsed), float(worked)
 
     @contextmanager
     def polkitd_stopped(self) -> Iterator[None]:

@@ -2,11 +2,12 @@
 //
 //   start_time BUS_NAME PROGRAM [ARGUMENT...]
 //
-// Prints the microseconds, and ends the daemon.
+// Prints the microseconds, and how many of them the daemon was at work for; ends the daemon.
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <ctime>
 
 #include <fcntl.h>
 #include <sys/wait.h>
@@ -18,8 +19,19 @@ static constexpr guint LIMIT_SECONDS = 60;
 
 struct waiting {
     GMainLoop *loop;
-    gint64 end;  // 0 until the name is owned
+    pid_t child;
+    gint64 end;     // 0 until the name is owned
+    gint64 worked;  // by the daemon's own clock
 };
+
+// Of all threads of a process.
+static gint64 processor_microseconds(pid_t process) {
+    clockid_t clock = 0;
+    struct timespec time = {};
+    if (clock_getcpuclockid(process, &clock) != 0 || clock_gettime(clock, &time) != 0)
+        return 0;
+    return gint64{time.tv_sec} * G_USEC_PER_SEC + time.tv_nsec / 1000;
+}
 
 static void on_owner_changed(GDBusConnection *, const char *, const char *, const char *,
                              const char *, GVariant *parameters, void *data) {
@@ -30,6 +42,7 @@ static void on_owner_changed(GDBusConnection *, const char *, const char *, cons
     if (*new_owner == '\0')
         return;
     state->end = g_get_monotonic_time();
+    state->worked = processor_microseconds(state->child);
     g_main_loop_quit(state->loop);
 }
 
@@ -57,7 +70,7 @@ int main(int argc, char **argv) {
         (void)fprintf(stderr, "start_time: %s\n", error->message);
         return EXIT_FAILURE;
     }
-    waiting state = {g_main_loop_new(nullptr, FALSE), 0};
+    waiting state = {g_main_loop_new(nullptr, FALSE), 0, 0, 0};
     (void)g_dbus_connection_signal_subscribe(bus, "org.freedesktop.DBus", "org.freedesktop.DBus",
                                              "NameOwnerChanged", "/org/freedesktop/DBus", argv[1],
                                              G_DBUS_SIGNAL_FLAGS_NONE, on_owner_changed, &state,
@@ -74,13 +87,14 @@ int main(int argc, char **argv) {
         run_daemon(argv + 2);
     if (child < 0)
         return EXIT_FAILURE;
+    state.child = child;
     g_main_loop_run(state.loop);
 
     int status = 0;
     (void)kill(child, SIGTERM);
-    if (waitpid(child, &status, 0) != child || state.end == 0) {
+    if (waitpid(child, &status, 0) != child || state.end == 0 || state.worked == 0) {
         (void)fprintf(stderr, "start_time: %s did not take %s\n", argv[2], argv[1]);
         return EXIT_FAILURE;
     }
-    (void)printf("%.3f\n", static_cast<double>(state.end - start));
+    (void)printf("%" G_GINT64_FORMAT " %" G_GINT64_FORMAT "\n", state.end - start, state.worked);
 }

@@ -37,6 +37,11 @@ def test_all_met_is_status_0() -> None:
     assert status_of(results_that_meet_all()) == 0
 
 
+def test_only_what_has_no_unit_has_slack() -> None:
+    assert {goal.number for goal in GOALS if goal.slack == 0} == {"18", "25a", "25b", "25c"}
+    assert all((goal.slack == 0) == bool(goal.unit) for goal in GOALS)
+
+
 @pytest.mark.parametrize("goal", GOALS, ids=lambda goal: goal.number)
 def test_each_goal_that_is_missed_or_not_measured_fails_the_run(goal) -> None:
     missed = results_that_meet_all()
