@@ -278,3 +278,43 @@ TEST(AccountSecrets, CheckingWritingAndReadingALineLeaveNoCopy) {
               // Of the record before, and after the check and the writing; then of the one read.
               "1 1 1 1 0 ");
 }
+
+// The text is written without another copy of the hash, which is veiled.
+static void write_line_with_hash(const char *path, const char *before, const std::string &after) {
+    unveiled hash(HASH.string());
+    FILE *file = std::fopen(path, "we");
+    static char buffer[BUFSIZ];
+    if (file == nullptr || std::setvbuf(file, buffer, _IOFBF, sizeof buffer) != 0 ||
+        std::fprintf(file, "%s:%s:%s", before, hash.text(), after.c_str()) < 0 ||
+        std::fclose(file) != 0)
+        std::abort();
+    explicit_bzero(buffer, sizeof buffer);
+    hash.wipe();
+}
+
+// A line that the room was too small for at first, and one that is damaged and passed over.
+TEST(AccountSecrets, RoomOfALineLeavesNoCopy) {
+    EXPECT_EQ(from_clean_process([] {
+                  std::string members = "a";
+                  for (int i = 0; i < 3000; i++)
+                      members += ",m";
+                  write_line_with_hash("etc/group", LONG_NAME, "44:" + members + "\n");
+                  write_line_with_hash("etc/shadow", LONG_NAME, "damaged::::::\nb:*:1::::::\n");
+                  const auto read_row = [](core_file_row row) {
+                      core_file_data incoming = {};
+                      (void)core_file_read_data(&core_file_table[row], &incoming, nullptr);
+                      return incoming.data;
+                  };
+
+                  std::string said = std::to_string(copies_of_hash()) + " ";
+                  GPtrArray *groups = read_row(CORE_FILE_ROW_GROUP);
+                  said += std::to_string(copies_of_hash()) + " ";
+                  g_ptr_array_unref(groups);
+                  said += std::to_string(copies_of_hash()) + " ";
+                  GPtrArray *shadows = read_row(CORE_FILE_ROW_SHADOW);
+                  said += std::to_string(copies_of_hash()) + " of " + std::to_string(shadows->len);
+                  g_ptr_array_unref(shadows);
+                  return said;
+              }),
+              "0 1 0 0 of 1");
+}
