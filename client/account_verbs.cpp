@@ -1,0 +1,81 @@
+// client/account_verbs.cpp: the arguments of the digest commands.
+#include "client/account_verbs.h"
+
+#include <cerrno>
+#include <cstring>
+
+#include <unistd.h>
+
+#include "client/arguments.h"
+#include "client/client_error.h"
+#include "client/password_prompt.h"
+
+static constexpr const char *REALM = "PRIVANE";
+
+// Far more than a device has accounts.
+static constexpr gsize LONGEST_LIST = 1024 * 1024;
+
+static GVariant *digest_arguments(const char *action, const char *list) {
+    const char *const arguments[] = {action, list, nullptr};
+    return g_variant_new("(^as)", arguments);
+}
+
+GVariant *build_digest_set(const command_line &line, GError **error) {
+    const char *name = word_at(line, 2);
+
+    // The first ":" of the entry ends the name.
+    if (std::strpbrk(name, ":\n") != nullptr) {
+        (void)fail_usage(error, "no web login can be named '%s'", name);
+        return nullptr;
+    }
+    g_auto(wiped_string) password = arguments_password(line, true, error);
+    if (password == nullptr)
+        return nullptr;
+    g_auto(wiped_string) clear = g_strconcat(name, ":", REALM, ":", password, nullptr);
+    g_auto(wiped_string) hash = g_compute_checksum_for_string(G_CHECKSUM_MD5, clear, -1);
+    g_auto(wiped_string) entry = g_strconcat(name, ":", REALM, ":", hash, "\n", nullptr);
+    return digest_arguments("set", entry);
+}
+
+// Null with an error. What it held is wiped by its owner, for hashes log in as passwords do.
+static char *read_list(GError **error) {
+    g_auto(wiped_string) list = static_cast<char *>(g_malloc0(LONGEST_LIST + 1));
+    gsize length = 0;
+
+    for (;;) {
+        const ssize_t count = read(STDIN_FILENO, list + length, LONGEST_LIST + 1 - length);
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count < 0) {
+            (void)fail_failed(error, "Cannot read the list: %s", g_strerror(errno));
+            return nullptr;
+        }
+        if (count == 0)
+            break;
+        length += static_cast<gsize>(count);
+        if (length > LONGEST_LIST) {
+            list[LONGEST_LIST] = '\0';
+            (void)fail_failed(error, "The list is longer than %" G_GSIZE_FORMAT " bytes",
+                              LONGEST_LIST);
+            return nullptr;
+        }
+    }
+    if (length == 0 || !g_utf8_validate(list, static_cast<gssize>(length), nullptr)) {
+        (void)fail_failed(error, length == 0 ? "The list is empty" : "The list is no UTF-8 text");
+        return nullptr;
+    }
+    return g_steal_pointer(&list);
+}
+
+GVariant *build_digest_import(const command_line &, GError **error) {
+    g_auto(wiped_string) list = read_list(error);
+    return list != nullptr ? digest_arguments("set", list) : nullptr;
+}
+
+GVariant *build_digest_delete(const command_line &line, GError **) {
+    g_autoptr(GString) list = g_string_new(nullptr);
+
+    for (guint i = 2; i < line.words->len; i++)
+        g_string_append_printf(list, "%s\n", word_at(line, i));
+    return digest_arguments("delete", list->str);
+}

@@ -1,0 +1,46 @@
+// client/display_text.cpp: texts from the bus made fit for a terminal.
+#include "client/display_text.h"
+
+#include <glib.h>
+
+static bool must_be_escaped(gunichar c) {
+    switch (g_unichar_type(c)) {
+        case G_UNICODE_CONTROL:
+        case G_UNICODE_FORMAT:
+        case G_UNICODE_LINE_SEPARATOR:
+        case G_UNICODE_PARAGRAPH_SEPARATOR:
+        case G_UNICODE_SURROGATE:
+            return true;
+        default:
+            return false;
+    }
+}
+
+char *display_escape(const char *text, bool keeps_lines) {
+    g_autofree char *valid = g_utf8_make_valid(text, -1);
+    GString *escaped = g_string_new(nullptr);
+
+    for (const char *at = valid; *at != '\0'; at = g_utf8_next_char(at)) {
+        const gunichar c = g_utf8_get_char(at);
+        if ((keeps_lines && (c == '\n' || c == '\t')) || !must_be_escaped(c))
+            g_string_append_unichar(escaped, c);
+        else if (c <= 0xff)
+            g_string_append_printf(escaped, "\\x%02x", c);
+        else
+            g_string_append_printf(escaped, c <= 0xffff ? "\\u%04x" : "\\U%08x", c);
+    }
+    return g_string_free(escaped, FALSE);
+}
+
+int display_width(const char *text) {
+    int width = 0;
+
+    for (const char *at = text; *at != '\0'; at = g_utf8_next_char(at)) {
+        const gunichar c = g_utf8_get_char(at);
+        if (g_unichar_iswide(c))
+            width += 2;
+        else if (!g_unichar_iszerowidth(c))
+            width++;
+    }
+    return width;
+}

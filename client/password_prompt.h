@@ -1,0 +1,23 @@
+// client/password_prompt.h: passwords from the terminal or from a descriptor, and their wiping.
+#pragma once
+
+#include <cstring>
+
+#include <glib.h>
+
+// Accepts null.
+inline void wipe_free(char *secret) {
+    if (secret != nullptr)
+        explicit_bzero(secret, std::strlen(secret));
+    g_free(secret);
+}
+
+typedef char *wiped_string;
+G_DEFINE_AUTO_CLEANUP_FREE_FUNC(wiped_string, wipe_free, nullptr)
+
+// Null with an error. The first line of what the descriptor has, without its end.
+char *password_read(int fd, GError **error);
+
+// Null with an error. Asks on the terminal of the process, whatever its standard streams are, and
+// shows nothing of what is typed; a new password is asked for twice.
+char *password_ask(const char *prompt, bool is_new, GError **error);

@@ -1,0 +1,58 @@
+// client/session.cpp: the bus, the call, and standard output.
+#include "client/session.h"
+
+#include <cerrno>
+#include <cstdio>
+#include <cstring>
+
+#include "client/client_error.h"
+#include "privane_system_binding.h"
+
+static constexpr const char *NAME = "com.zintor.PrivaneSystem";
+static constexpr const char *PATH = "/com/zintor/PrivaneSystem";
+
+GDBusConnection *session_connect(const session &run, GError **error) {
+    const char *address = run.line->options[OPTION_ADDRESS];
+    GDBusConnection *bus = nullptr;
+
+    if (address == nullptr) {
+        bus = g_bus_get_sync(G_BUS_TYPE_SYSTEM, nullptr, error);
+    } else {
+        const int flags = G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_CLIENT |
+                          G_DBUS_CONNECTION_FLAGS_MESSAGE_BUS_CONNECTION;
+        bus = g_dbus_connection_new_for_address_sync(
+            address, static_cast<GDBusConnectionFlags>(flags), nullptr, nullptr, error);
+    }
+    if (bus == nullptr) {
+        g_prefix_error(error, "Cannot reach the bus: ");
+        return nullptr;
+    }
+    // A bus that goes is told as an error.
+    g_dbus_connection_set_exit_on_close(bus, FALSE);
+    return bus;
+}
+
+GVariant *session_call(const session &run, const GDBusMethodInfo *method, GVariant *arguments,
+                       GError **error) {
+    g_autoptr(GVariant) owned = g_variant_ref_sink(arguments);
+    g_autoptr(GDBusConnection) bus = session_connect(run, error);
+    const int flags = G_DBUS_PROXY_FLAGS_DO_NOT_LOAD_PROPERTIES |
+                      G_DBUS_PROXY_FLAGS_DO_NOT_CONNECT_SIGNALS |
+                      G_DBUS_PROXY_FLAGS_DO_NOT_AUTO_START_AT_CONSTRUCTION;
+
+    if (bus == nullptr)
+        return nullptr;
+    g_autoptr(PrivaneSystem) proxy = privane_system__proxy_new_sync(
+        bus, static_cast<GDBusProxyFlags>(flags), NAME, PATH, nullptr, error);
+    if (proxy == nullptr)
+        return nullptr;
+    return g_dbus_proxy_call_sync(G_DBUS_PROXY(proxy), method->name, owned, G_DBUS_CALL_FLAGS_NONE,
+                                  run.line->timeout_ms, nullptr, error);
+}
+
+bool session_print(const char *text, GError **error) {
+    if (std::fputs(text, stdout) != EOF && std::fflush(stdout) == 0)
+        return true;
+    const int saved = errno;
+    return fail_failed(error, "Cannot write to standard output: %s", g_strerror(saved));
+}

@@ -1,0 +1,25 @@
+// client/session.h: one run of the client: what was asked for, and how to print what comes of it.
+#pragma once
+
+#include <gio/gio.h>
+
+#include "client/command_line.h"
+
+struct command;
+
+struct session {
+    const command_line *line;
+    const command *asked;
+    bool on_terminal;  // of standard output
+    bool in_color;
+};
+
+// The bus of the command line, or null with an error.
+GDBusConnection *session_connect(const session &run, GError **error);
+
+// What the service answers to a method, or null with an error.
+GVariant *session_call(const session &run, const GDBusMethodInfo *method, GVariant *arguments,
+                       GError **error);
+
+// Prints to standard output, at once; false with an error.
+bool session_print(const char *text, GError **error);
