@@ -39,6 +39,9 @@ static void add_values(const unfinished &line, value_kind kind, const char *choi
                        const char *prefix, const char *typed) {
     g_auto(GStrv) values = completion_values(*line.run, kind, choices);
 
+    // The shell completes paths itself.
+    if (kind == value_kind::FILE_PATH)
+        add_candidate(line, prefix, ":files", "");
     for (char **value = values; *value != nullptr; value++)
         add_candidate(line, prefix, *value, typed);
 }

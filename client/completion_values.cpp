@@ -105,9 +105,6 @@ char **completion_values(const session &run, value_kind kind, const char *choice
         case value_kind::METHOD:
             add_methods(values);
             break;
-        case value_kind::FILE_PATH:
-            g_strv_builder_add(values, ":files");
-            break;
         case value_kind::DISK:
             add_entries("/sys/block", DISKS, "/dev/", values);
             break;
@@ -117,6 +114,7 @@ char **completion_values(const session &run, value_kind kind, const char *choice
         case value_kind::CHOICE:
             add_choices(choices, values);
             break;
+        case value_kind::FILE_PATH:
         case value_kind::TEXT:
             break;
     }

@@ -82,6 +82,7 @@ class Terminal:
                  program: Sequence[str] = (PROGRAM,)) -> None:
         self._master, slave = pty.openpty()
         self.shown = ""
+        self.passed = ""
 
         def take_terminal() -> None:
             fcntl.ioctl(slave, termios.TIOCSCTTY, 0)
@@ -95,12 +96,12 @@ class Terminal:
         return bool(termios.tcgetattr(self.settings)[3] & termios.ECHO)
 
     def await_text(self, text: str) -> None:
-        """Until the text was shown behind what was awaited before."""
+        """Until the text was shown behind what was awaited before; passed is what came between."""
         end = time.monotonic() + SECONDS
         while text not in self.shown:
             assert time.monotonic() < end, (text, self.shown)
-            self._read(0.1)
-        self.shown = self.shown[self.shown.index(text) + len(text):]
+            self.read(0.1)
+        self.passed, _, self.shown = self.shown.partition(text)
 
     def type(self, text: str) -> None:
         os.write(self._master, text.encode())
@@ -110,8 +111,8 @@ class Terminal:
         end = time.monotonic() + SECONDS
         while self.process.poll() is None:
             assert time.monotonic() < end, self.shown
-            self._read(0.02)
-        while self._read(0):
+            self.read(0.02)
+        while self.read(0):
             pass
         return self.process.returncode
 
@@ -122,7 +123,7 @@ class Terminal:
         os.close(self.settings)
         os.close(self._master)
 
-    def _read(self, seconds: float) -> bool:
+    def read(self, seconds: float) -> bool:
         if not select.select([self._master], [], [], seconds)[0]:
             return False
         self.shown += os.read(self._master, 65536).decode().replace("\r\n", "\n")

@@ -1,0 +1,190 @@
+"""tests/bus/test_privanectl_passwords.py: where the client takes passwords from, and where it
+leaves none."""
+import os
+import signal
+import subprocess
+import time
+from pathlib import Path
+from typing import Iterator
+
+import pytest
+
+from harness.changing_accounts import stored_hash
+from harness.passwords import MARK, NEW, OLD, is_hash_of
+from harness.privanectl import (DONE, PROGRAM, Run, Terminal, failed, privanectl, surroundings,
+                                with_password)
+from harness.stage import Stage
+
+NOTHING = Run(DONE, "", "")
+PASSWD = ("user", "passwd", "bob")
+
+
+@pytest.fixture
+def prompt(stage: Stage) -> Iterator[Terminal]:
+    """privanectl user passwd bob, which has asked for the password."""
+    terminal = Terminal(*PASSWD)
+    terminal.await_text("New password: ")
+    yield terminal
+    terminal.close()
+
+
+def test_password_is_asked_for_twice_and_not_shown(prompt: Terminal) -> None:
+    assert not prompt.echoes()
+    prompt.type(f"{NEW}\n")
+    prompt.await_text("Again: ")
+    prompt.type(f"{NEW}\n")
+
+    assert prompt.wait() == 0
+    assert prompt.shown == "\n"
+    assert prompt.echoes()
+    assert is_hash_of(stored_hash("bob"), NEW)
+
+
+def test_passwords_that_differ_are_not_used(prompt: Terminal) -> None:
+    prompt.type(f"{NEW}\n")
+    prompt.await_text("Again: ")
+    prompt.type(f"{OLD}x\n")
+
+    assert prompt.wait() == 1
+    assert prompt.shown == "\nprivanectl: The passwords differ\n"
+    assert is_hash_of(stored_hash("bob"), OLD)
+
+
+def test_password_may_be_corrected(prompt: Terminal) -> None:
+    for _ in range(2):
+        prompt.type(f"wrong\x15{NEW}x\x7f\n")
+    assert prompt.wait() == 0
+    assert is_hash_of(stored_hash("bob"), NEW)
+
+
+@pytest.mark.parametrize("number", [signal.SIGINT, signal.SIGTERM, signal.SIGHUP])
+def test_signal_ends_the_question_and_brings_the_echo_back(number: signal.Signals,
+                                                           prompt: Terminal) -> None:
+    if number == signal.SIGINT:
+        prompt.type("half\x03")
+    else:
+        prompt.process.send_signal(number)
+
+    assert prompt.wait() == -number
+    assert prompt.echoes()
+    assert is_hash_of(stored_hash("bob"), OLD)
+
+
+def test_terminal_stop_is_no_way_out_without_echo(prompt: Terminal) -> None:
+    prompt.type("\x1a")
+    time.sleep(0.1)  # A stop would have come by then.
+    state = Path(f"/proc/{prompt.process.pid}/stat").read_text().rpartition(") ")[2][0]
+
+    assert state != "T"
+
+
+def test_end_of_input_is_an_empty_password(prompt: Terminal) -> None:
+    prompt.type("\x04")
+    prompt.type("\x04")
+
+    assert prompt.wait() == 1  # The service refuses it, or changes nothing.
+    assert is_hash_of(stored_hash("bob"), OLD)
+
+
+def test_question_for_an_old_password_comes_once(stage: Stage) -> None:
+    terminal = Terminal("user", "authenticate", "bob")
+    try:
+        terminal.await_text("Password: ")
+        terminal.type(f"{OLD}\n")
+        assert terminal.wait() == 0
+        assert terminal.shown == "\n"
+    finally:
+        terminal.close()
+
+
+def test_question_goes_to_the_terminal_whatever_the_output_is(stage: Stage, tmp_path: Path) -> None:
+    file = tmp_path / "output"
+    terminal = Terminal("-c", f"{PROGRAM} user passwd bob </dev/null >{file} 2>&1",
+                        program=("/bin/bash",))
+    try:
+        for text in ("New password: ", "Again: "):
+            terminal.await_text(text)
+            terminal.type(f"{NEW}\n")
+        assert terminal.wait() == 0
+        assert file.read_text() == ""
+        assert is_hash_of(stored_hash("bob"), NEW)
+    finally:
+        terminal.close()
+
+
+def test_optional_password_is_asked_for_on_demand(stage: Stage) -> None:
+    terminal = Terminal("user", "modify", "bob", "--ask-password")
+    try:
+        for text in ("New password: ", "Again: "):
+            terminal.await_text(text)
+            terminal.type(f"{NEW}\n")
+        assert terminal.wait() == 0
+        assert is_hash_of(stored_hash("bob"), NEW)
+    finally:
+        terminal.close()
+
+
+def test_no_terminal(stage: Stage) -> None:
+    assert privanectl(*PASSWD) == failed(
+        "No terminal to ask for the password on; see --password-fd")
+    assert privanectl(*PASSWD, stdin=f"{NEW}\n") == failed(
+        "No terminal to ask for the password on; see --password-fd")
+
+
+def test_password_from_standard_input(stage: Stage) -> None:
+    assert privanectl(*PASSWD, "--password-fd=0", stdin=f"{NEW}\n") == NOTHING
+    assert is_hash_of(stored_hash("bob"), NEW)
+
+
+@pytest.mark.parametrize("password, text", [
+    ("x" * 1024, "The password is too long, or has a NUL byte"),
+    (f"{NEW}\0", "The password is too long, or has a NUL byte"),
+    (b"\xff\xfe", "The password is no UTF-8"),
+])
+def test_password_that_cannot_be_one(password: str | bytes, text: str, stage: Stage) -> None:
+    assert with_password(password, *PASSWD) == failed(text)
+    assert is_hash_of(stored_hash("bob"), OLD)
+
+
+def test_descriptor_that_is_none(stage: Stage) -> None:
+    assert privanectl(*PASSWD, "--password-fd=99") == failed(
+        "Cannot read the password: Bad file descriptor")
+
+
+def test_what_stands_behind_the_line_is_left_to_others(stage: Stage) -> None:
+    reading, writing = os.pipe()
+    os.write(writing, f"{NEW}\nnext\n".encode())
+    os.close(writing)
+    try:
+        assert privanectl(*PASSWD, f"--password-fd={reading}", descriptors=(reading,)) == NOTHING
+        assert os.read(reading, 100) == b"next\n"
+    finally:
+        os.close(reading)
+
+
+def test_no_option_takes_a_password(stage: Stage) -> None:
+    assert privanectl(*PASSWD, NEW).status == 2
+    assert privanectl(*PASSWD, f"--password={NEW}").status == 2
+
+
+def test_no_password_shows_in_the_process_list(stage: Stage) -> None:
+    reading, writing = os.pipe()
+    os.write(writing, f"{NEW}\n".encode())
+    # A service that does not answer keeps the client as it is when the password is on its way.
+    os.kill(stage.service.pid, signal.SIGSTOP)
+    client = subprocess.Popen([PROGRAM, *PASSWD, f"--password-fd={reading}"], pass_fds=(reading,),
+                              env=surroundings())
+    try:
+        end = time.monotonic() + 30
+        while "poll" not in Path(f"/proc/{client.pid}/wchan").read_text():
+            assert time.monotonic() < end
+            time.sleep(0.01)
+        seen = [Path(f"/proc/{client.pid}/{name}").read_bytes() for name in ("cmdline", "environ")]
+    finally:
+        os.kill(stage.service.pid, signal.SIGCONT)
+    assert client.wait(60) == 0
+    assert is_hash_of(stored_hash("bob"), NEW)
+    assert PROGRAM.encode() in seen[0] and b"TERM=" in seen[1]
+    assert not [text for text in seen if MARK.encode() in text]
+    os.close(reading)
+    os.close(writing)
