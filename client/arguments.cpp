@@ -22,7 +22,7 @@ char *arguments_password(const command_line &line, bool is_new, GError **error) 
         (void)fail_usage(error, "--password-fd takes the number of a descriptor, not '%s'", given);
         return nullptr;
     }
-    return password_read(static_cast<int>(fd), error);
+    return password_read(static_cast<int>(fd), is_new, error);
 }
 
 static char *password_of(source from, const command_line &line, GError **error) {

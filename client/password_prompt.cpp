@@ -7,6 +7,7 @@
 #include <iterator>
 
 #include <fcntl.h>
+#include <poll.h>
 #include <termios.h>
 #include <unistd.h>
 
@@ -24,17 +25,29 @@ static void on_signal(int number) {
 
 enum class line_end { FOUND, SIGNAL, FAILED };
 
-// Byte by byte: what stands behind the line is another's. Wipes nothing of what it returns.
-static line_end read_line(int fd, char *line, std::size_t size, GError **error) {
+// Until there is something to read, or one of the ending signals has come: they are blocked but
+// here, so that none comes unseen right in front of the waiting.
+static bool await_input(int fd, const sigset_t *mask) {
+    pollfd waited = {fd, POLLIN, 0};
+
+    while (caught_signal == 0)
+        if (ppoll(&waited, 1, nullptr, mask) >= 0 || errno != EINTR)
+            return true;
+    return false;
+}
+
+// Byte by byte: what stands behind the line is another's. Wipes nothing of what it returns. mask:
+// that of await_input, or null where signals are as ever.
+static line_end read_line(int fd, const sigset_t *mask, char *line, std::size_t size,
+                          GError **error) {
     std::size_t length = 0;
 
     for (;;) {
+        if (mask != nullptr && !await_input(fd, mask))
+            return line_end::SIGNAL;
         const ssize_t count = read(fd, line + length, 1);
-        if (count < 0 && errno == EINTR) {
-            if (caught_signal != 0)
-                return line_end::SIGNAL;
+        if (count < 0 && errno == EINTR)
             continue;
-        }
         if (count < 0) {
             (void)fail_failed(error, "Cannot read the password: %s", g_strerror(errno));
             return line_end::FAILED;
@@ -50,38 +63,48 @@ static line_end read_line(int fd, char *line, std::size_t size, GError **error) 
     return line_end::FOUND;
 }
 
-static char *copy_password(const char *line, GError **error) {
-    if (g_utf8_validate(line, -1, nullptr))
-        return g_strdup(line);
-    (void)fail_failed(error, "The password is no UTF-8");
-    return nullptr;
+// The service takes an empty password for none, and would leave the old one as it is.
+static char *copy_password(const char *line, bool is_new, GError **error) {
+    if (!g_utf8_validate(line, -1, nullptr)) {
+        (void)fail_failed(error, "The password is no UTF-8");
+        return nullptr;
+    }
+    if (is_new && *line == '\0') {
+        (void)fail_failed(error, "The password is empty");
+        return nullptr;
+    }
+    return g_strdup(line);
 }
 
-char *password_read(int fd, GError **error) {
+char *password_read(int fd, bool is_new, GError **error) {
     char line[LONGEST_LINE] = {};
     char *password = nullptr;
 
-    if (read_line(fd, line, sizeof line, error) == line_end::FOUND)
-        password = copy_password(line, error);
+    if (read_line(fd, nullptr, line, sizeof line, error) == line_end::FOUND)
+        password = copy_password(line, is_new, error);
     explicit_bzero(line, sizeof line);
     return password;
 }
 
-// The terminal without echo and the signals that would leave it so; the old state comes back with
-// the end of its life.
+// The terminal without echo, and the signals that would leave it so held back; the old state of
+// both comes back with the end of its life.
 class silent_terminal {
   public:
     explicit silent_terminal(int fd) : fd_(fd) {
         struct sigaction action = {};
+        sigset_t ending;
 
-        action.sa_handler = on_signal;  // No SA_RESTART: a signal ends the reading.
+        (void)sigemptyset(&ending);
+        action.sa_handler = on_signal;
         caught_signal = 0;
-        for (std::size_t i = 0; i < std::size(ENDING_SIGNALS); i++)
+        for (std::size_t i = 0; i < std::size(ENDING_SIGNALS); i++) {
+            (void)sigaddset(&ending, ENDING_SIGNALS[i]);
             (void)sigaction(ENDING_SIGNALS[i], &action, &old_actions_[i]);
+        }
+        (void)sigprocmask(SIG_BLOCK, &ending, &old_mask_);
         action.sa_handler = SIG_IGN;
         (void)sigaction(SIGTSTP, &action, &old_stop_);
-        is_silent_ = tcgetattr(fd_, &old_state_) == 0;
-        if (!is_silent_)
+        if (tcgetattr(fd_, &old_state_) != 0)
             return;
         termios silent = old_state_;
         silent.c_lflag &= ~static_cast<tcflag_t>(ECHO);
@@ -90,7 +113,8 @@ class silent_terminal {
     }
     ~silent_terminal() {
         if (is_silent_)
-            (void)tcsetattr(fd_, TCSAFLUSH, &old_state_);
+            (void)tcsetattr(fd_, TCSADRAIN, &old_state_);
+        (void)sigprocmask(SIG_SETMASK, &old_mask_, nullptr);
         for (std::size_t i = 0; i < std::size(ENDING_SIGNALS); i++)
             (void)sigaction(ENDING_SIGNALS[i], &old_actions_[i], nullptr);
         (void)sigaction(SIGTSTP, &old_stop_, nullptr);
@@ -99,43 +123,51 @@ class silent_terminal {
     silent_terminal &operator=(const silent_terminal &) = delete;
 
     bool is_silent() const { return is_silent_; }
+    const sigset_t *old_mask() const { return &old_mask_; }
 
   private:
     int fd_;
     bool is_silent_ = false;
     termios old_state_ = {};
+    sigset_t old_mask_ = {};
     struct sigaction old_actions_[std::size(ENDING_SIGNALS)] = {};
     struct sigaction old_stop_ = {};
 };
 
-static bool write_text(int fd, const char *text) {
-    return write(fd, text, std::strlen(text)) == static_cast<ssize_t>(std::strlen(text));
+// Null with an error, or without one where a signal has ended it.
+static char *ask_line(int fd, const silent_terminal &terminal, const char *prompt, bool is_new,
+                      GError **error) {
+    char line[LONGEST_LINE] = {};
+    char *password = nullptr;
+
+    if (write(fd, prompt, std::strlen(prompt)) != static_cast<ssize_t>(std::strlen(prompt))) {
+        (void)fail_failed(error, "Cannot ask for the password: %s", g_strerror(errno));
+        return nullptr;
+    }
+    if (read_line(fd, terminal.old_mask(), line, sizeof line, error) == line_end::FOUND)
+        password = copy_password(line, is_new, error);
+    explicit_bzero(line, sizeof line);
+    return password;
 }
 
-static line_end ask_line(int fd, const char *prompt, char *line, std::size_t size, GError **error) {
+static char *ask_in_silence(int fd, const char *prompt, bool is_new, GError **error) {
     const silent_terminal terminal(fd);
 
     // Rather no password than one that everybody behind the user can read.
-    if (!terminal.is_silent() || !write_text(fd, prompt)) {
-        (void)fail_failed(error, "Cannot ask for the password: %s", g_strerror(errno));
-        return line_end::FAILED;
+    if (!terminal.is_silent()) {
+        (void)fail_failed(error, "Cannot ask for the password: the terminal shows what is typed");
+        return nullptr;
     }
-    return read_line(fd, line, size, error);
-}
-
-static char *ask_once(int fd, const char *prompt, GError **error) {
-    char line[LONGEST_LINE] = {};
-    char *password = nullptr;
-    const line_end end = ask_line(fd, prompt, line, sizeof line, error);
-
-    if (end == line_end::FOUND)
-        password = copy_password(line, error);
-    explicit_bzero(line, sizeof line);
-    if (end == line_end::SIGNAL) {
-        (void)raise(static_cast<int>(caught_signal));  // Now it has its usual end, if it ends.
-        (void)fail_failed(error, "Interrupted");
-    }
-    return password;
+    g_auto(wiped_string) password = ask_line(fd, terminal, prompt, is_new, error);
+    if (password == nullptr || !is_new)
+        return g_steal_pointer(&password);
+    g_auto(wiped_string) repeated = ask_line(fd, terminal, "Again: ", is_new, error);
+    if (repeated == nullptr)
+        return nullptr;
+    if (std::strcmp(password, repeated) == 0)
+        return g_steal_pointer(&password);
+    (void)fail_failed(error, "The passwords differ");
+    return nullptr;
 }
 
 char *password_ask(const char *prompt, bool is_new, GError **error) {
@@ -145,14 +177,13 @@ char *password_ask(const char *prompt, bool is_new, GError **error) {
         (void)fail_failed(error, "No terminal to ask for the password on; see --password-fd");
         return nullptr;
     }
-    g_auto(wiped_string) password = ask_once(fd, prompt, error);
-    if (password != nullptr && is_new) {
-        g_auto(wiped_string) repeated = ask_once(fd, "Again: ", error);
-        if (repeated != nullptr && std::strcmp(password, repeated) != 0)
-            (void)fail_failed(error, "The passwords differ");
-        if (repeated == nullptr || std::strcmp(password, repeated) != 0)
-            g_clear_pointer(&password, wipe_free);
-    }
+    char *password = ask_in_silence(fd, prompt, is_new, error);
     (void)close(fd);
-    return g_steal_pointer(&password);
+    if (caught_signal != 0) {
+        (void)raise(static_cast<int>(caught_signal));  // Its usual end; it may be ignored.
+        if (error != nullptr && *error == nullptr)
+            (void)fail_failed(error, "Interrupted");
+        g_clear_pointer(&password, wipe_free);
+    }
+    return password;
 }

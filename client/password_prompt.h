@@ -15,8 +15,9 @@ inline void wipe_free(char *secret) {
 typedef char *wiped_string;
 G_DEFINE_AUTO_CLEANUP_FREE_FUNC(wiped_string, wipe_free, nullptr)
 
-// Null with an error. The first line of what the descriptor has, without its end.
-char *password_read(int fd, GError **error);
+// Null with an error, as for a new password that is empty. The first line of what the descriptor
+// has, without its end.
+char *password_read(int fd, bool is_new, GError **error);
 
 // Null with an error. Asks on the terminal of the process, whatever its standard streams are, and
 // shows nothing of what is typed; a new password is asked for twice.

@@ -51,8 +51,7 @@ def test_passwords_that_differ_are_not_used(prompt: Terminal) -> None:
 
 
 def test_password_may_be_corrected(prompt: Terminal) -> None:
-    for _ in range(2):
-        prompt.type(f"wrong\x15{NEW}x\x7f\n")
+    prompt.type(2 * f"wrong\x15{NEW}x\x7f\n")
     assert prompt.wait() == 0
     assert is_hash_of(stored_hash("bob"), NEW)
 
@@ -78,11 +77,12 @@ def test_terminal_stop_is_no_way_out_without_echo(prompt: Terminal) -> None:
     assert state != "T"
 
 
-def test_end_of_input_is_an_empty_password(prompt: Terminal) -> None:
-    prompt.type("\x04")
-    prompt.type("\x04")
+@pytest.mark.parametrize("typed", ["\x04", "\n"])
+def test_empty_password_is_no_new_one(typed: str, prompt: Terminal) -> None:
+    prompt.type(typed)
 
-    assert prompt.wait() == 1  # The service refuses it, or changes nothing.
+    assert prompt.wait() == 1
+    assert prompt.shown.strip() == "privanectl: The password is empty"
     assert is_hash_of(stored_hash("bob"), OLD)
 
 
@@ -140,6 +140,8 @@ def test_password_from_standard_input(stage: Stage) -> None:
     ("x" * 1024, "The password is too long, or has a NUL byte"),
     (f"{NEW}\0", "The password is too long, or has a NUL byte"),
     (b"\xff\xfe", "The password is no UTF-8"),
+    ("", "The password is empty"),
+    ("\n", "The password is empty"),
 ])
 def test_password_that_cannot_be_one(password: str | bytes, text: str, stage: Stage) -> None:
     assert with_password(password, *PASSWD) == failed(text)
