@@ -13,7 +13,7 @@
 static constexpr const char *REALM = "PRIVANE";
 
 // Far more than a device has accounts.
-static constexpr gsize LONGEST_LIST = 1024 * 1024;
+static constexpr gsize LONGEST_LIST = 1UL << 20;
 
 static GVariant *digest_arguments(const char *action, const char *list) {
     const char *const arguments[] = {action, list, nullptr};

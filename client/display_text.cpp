@@ -20,7 +20,7 @@ char *display_escape(const char *text, bool keeps_lines) {
     g_autofree char *valid = g_utf8_make_valid(text, -1);
     GString *escaped = g_string_new(nullptr);
 
-    for (const char *at = valid; *at != '\0'; at = g_utf8_next_char(at)) {
+    for (const char *at = valid; *at != '\0'; at = g_utf8_find_next_char(at, nullptr)) {
         const gunichar c = g_utf8_get_char(at);
         if ((keeps_lines && (c == '\n' || c == '\t')) || !must_be_escaped(c))
             g_string_append_unichar(escaped, c);
@@ -35,7 +35,7 @@ char *display_escape(const char *text, bool keeps_lines) {
 int display_width(const char *text) {
     int width = 0;
 
-    for (const char *at = text; *at != '\0'; at = g_utf8_next_char(at)) {
+    for (const char *at = text; *at != '\0'; at = g_utf8_find_next_char(at, nullptr)) {
         const gunichar c = g_utf8_get_char(at);
         if (g_unichar_iswide(c))
             width += 2;

@@ -41,13 +41,14 @@ static void find_error(finding *found, const char *who, GError *error) {
     find(found, verdict::UNKNOWN, reason);
 }
 
-// The bus lets only some send to the service, whatever polkit says. Null where it lets us.
-static GError *knock(const session &run, GDBusConnection *bus) {
-    GError *error = nullptr;
+// The bus lets only some send to the service, whatever polkit says.
+static bool is_shut_out(const session &run, GDBusConnection *bus) {
+    g_autoptr(GError) error = nullptr;
     g_autoptr(GVariant) answer = g_dbus_connection_call_sync(
         bus, SERVICE, "/com/zintor/PrivaneSystem", "org.freedesktop.DBus.Peer", "Ping", nullptr,
         nullptr, G_DBUS_CALL_FLAGS_NO_AUTO_START, run.line->timeout_ms, nullptr, &error);
-    return error;
+
+    return answer == nullptr && g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_ACCESS_DENIED);
 }
 
 static GVariant *question_of(GDBusConnection *bus, const char *action, const char *unit,
@@ -104,10 +105,8 @@ static void ask_polkit(const session &run, GDBusConnection *bus, const method_ac
 
 static void judge(const session &run, GDBusConnection *bus, const method_action &action,
                   finding *found) {
-    g_autoptr(GError) closed = knock(run, bus);
-
     ask_polkit(run, bus, action, found);
-    if (g_error_matches(closed, G_DBUS_ERROR, G_DBUS_ERROR_ACCESS_DENIED))
+    if (is_shut_out(run, bus))
         find(found, verdict::NO, "the bus lets only root and the group privane call the service");
 }
 

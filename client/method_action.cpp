@@ -1,6 +1,7 @@
 // client/method_action.cpp: the polkit actions of the methods.
 #include "client/method_action.h"
 
+#include <algorithm>
 #include <cstring>
 
 #include "client/arguments.h"
@@ -108,10 +109,10 @@ void method_action_clear(method_action *action) {
 }
 
 bool method_action_amounts_to_root(const method_action &action) {
-    for (const char *name : ROOT_ACTIONS)
-        if (std::strcmp(action.id + std::strlen(PREFIX), name) == 0)
-            return true;
-    return false;
+    const char *name = action.id + std::strlen(PREFIX);
+
+    return std::ranges::any_of(ROOT_ACTIONS,
+                               [name](const char *other) { return std::strcmp(name, other) == 0; });
 }
 
 char *method_action_example_rule(const method_action &action, const char *user) {

@@ -39,7 +39,7 @@ static GPtrArray *escape_rows(GPtrArray *rows, std::size_t columns) {
     auto *shown = g_ptr_array_new_with_free_func(reinterpret_cast<GDestroyNotify>(g_strfreev));
 
     for (guint row = 0; row < rows->len; row++) {
-        auto *cells = static_cast<const char *const *>(rows->pdata[row]);
+        const auto *cells = static_cast<const char *const *>(rows->pdata[row]);
         auto *escaped = g_new0(char *, columns + 1);
         for (std::size_t i = 0; i < columns; i++)
             escaped[i] = display_escape(cells[i], false);

@@ -67,27 +67,20 @@ static bool is_password(source from) {
            from == source::CURRENT_PASSWORD;
 }
 
-bool takes_password(const command &row) {
-    for (const argument &taken : arguments_of(row))
-        if (is_password(taken.from))
-            return true;
-    return false;
+static bool is_taken_by(const argument &taken, option_id id) {
+    const bool is_option = taken.from == source::OPTION || taken.from == source::REQUIRED_OPTION;
+
+    if (id == OPTION_PASSWORD_FD)
+        return is_password(taken.from);
+    if (id == OPTION_ASK_PASSWORD)
+        return taken.from == source::OPTIONAL_PASSWORD;
+    return is_option && taken.option == id;
 }
 
 bool takes_option(const command &row, option_id id) {
-    if (id < FIRST_OWN_OPTION || id == row.selector)
-        return true;
-    for (const argument &taken : arguments_of(row)) {
-        const bool is_option =
-            taken.from == source::OPTION || taken.from == source::REQUIRED_OPTION;
-        if (is_option && taken.option == id)
-            return true;
-        if (id == OPTION_PASSWORD_FD && is_password(taken.from))
-            return true;
-        if (id == OPTION_ASK_PASSWORD && taken.from == source::OPTIONAL_PASSWORD)
-            return true;
-    }
-    return false;
+    return id < FIRST_OWN_OPTION || id == row.selector ||
+           std::ranges::any_of(arguments_of(row),
+                               [id](const argument &taken) { return is_taken_by(taken, id); });
 }
 
 // The words that must be there, and the most that may.

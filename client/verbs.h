@@ -83,7 +83,6 @@ guint name_length(const command &row);
 bool command_check(const command &row, const command_line &line, GError **error);
 
 bool takes_option(const command &row, option_id id);
-bool takes_password(const command &row);
 
 // The arguments as they stand in the help: "user show NAME".
 char *command_usage(const command &row);
