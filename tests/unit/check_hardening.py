@@ -1,6 +1,6 @@
 #!/usr/bin/python3
-# tests/unit/check_hardening.py: the service and its libraries are built hardened:
-# check_hardening.py COMPILE_COMMANDS PROGRAM LIBRARY...
+# tests/unit/check_hardening.py: the service, its libraries and its client are built hardened:
+# check_hardening.py COMPILE_COMMANDS PROGRAM LIBRARY... [PROGRAM]
 #
 # Each file must be position-independent, have no executable stack, have its relocations and all of
 # its bindings read-only before it starts, and check its stack frames; and the checked functions of
@@ -16,7 +16,7 @@ from pathlib import Path
 
 OPTIONS = ["-fstack-protector-strong", "-fstack-clash-protection", "-D_FORTIFY_SOURCE=2"]
 OPTIMIZED = re.compile(r" -O(1|2|3|s|g)\b")
-FOLDERS = ("service", "methods", "usermgmt", "platform")
+FOLDERS = ("client", "service", "methods", "usermgmt", "platform")
 
 # What -fcf-protection and -mbranch-protection add to an object file. The second is for who builds
 # the product: machines before ARMv8.3 know none of it.
@@ -28,6 +28,7 @@ AARCH64_FEATURES = {"standard": {"BTI", "PAC"}, "bti": {"BTI"}, "pac-ret": {"PAC
 # The checked functions that a file imports; those left out have no use for one.
 FORTIFIED = {
     "privane_system": {"__explicit_bzero_chk", "__syslog_chk"},
+    "privanectl": {"__explicit_bzero_chk", "__fprintf_chk"},
     "libdigestentry": {"__explicit_bzero_chk"},
     "liblogbackend": {"__syslog_chk"},
     "libparamcli": {"__explicit_bzero_chk"},
@@ -126,10 +127,11 @@ def faults_of_commands(path, machine):
 
 
 def main():
-    commands, program, *libraries = sys.argv[1:]
-    faults = list(faults_of_commands(commands, machine_of(program)))
-    for path in (program, *libraries):
-        faults += [f"{path}: {fault}" for fault in faults_of_file(path, path == program)]
+    commands, *files = sys.argv[1:]
+    libraries = [path for path in files if ".so." in Path(path).name]
+    faults = list(faults_of_commands(commands, machine_of(files[0])))
+    for path in files:
+        faults += [f"{path}: {fault}" for fault in faults_of_file(path, path not in libraries)]
     for fault in faults:
         print(fault, file=sys.stderr)
     return 1 if faults or len(libraries) != 6 else 0

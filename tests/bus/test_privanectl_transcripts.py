@@ -1,0 +1,63 @@
+"""tests/bus/test_privanectl_transcripts.py: what the documents show of the client is what it shows."""
+import shlex
+from pathlib import Path
+
+import pytest
+
+from harness.accounts import AccountFiles
+from harness.bus import Bus
+from harness.passwords import NEW, OLD_HASH
+from harness.privanectl import Terminal
+from harness.service_fixtures import StartService
+
+TREE = Path(__file__).parents[2]
+PROMPT = "    $ privanectl "
+
+PASSWD = """\
+root:x:0:0:root:/root:/bin/sh
+alice:x:1000:100:Alice Liddell:/home/alice:/bin/false
+"""
+SHADOW = f"root:{OLD_HASH}:19000:0:99999:7:0::\nalice:{OLD_HASH}:19000:0:99999:7:0::\n"
+GROUP = "root:x:0:\nusers:x:100:alice\noperator:x:102:alice\n"
+
+
+def transcripts(document: str) -> list[tuple[str, str]]:
+    """The commands that are shown, each with what it prints."""
+    found: list[tuple[str, list[str]]] = []
+    is_shown = False
+    for line in (TREE / document).read_text().splitlines():
+        if line.startswith(PROMPT):
+            found.append((line.removeprefix(PROMPT), []))
+            is_shown = True
+        elif is_shown and (line.startswith("    ") or not line):
+            found[-1][1].append(line[4:])
+        else:
+            is_shown = False
+    return [(command, "\n".join(lines).rstrip()) for command, lines in found]
+
+
+def test_there_are_some() -> None:
+    assert len(transcripts("README.md")) == 3
+    assert len(transcripts("docs/privanectl.md")) == 4
+
+
+@pytest.mark.parametrize("command, shown", [*transcripts("README.md"),
+                                            *transcripts("docs/privanectl.md")])
+def test_transcript(command: str, shown: str, accounts: AccountFiles, start: StartService,
+                    bus: Bus) -> None:
+    accounts.write_exactly(PASSWD, SHADOW, GROUP)
+    service = start()
+    service.wait_registered(bus)
+    terminal = Terminal(*shlex.split(command), environment={"TERM": "dumb"})
+    try:
+        seen = ""
+        for question in ("New password: ", "Again: "):
+            if question.strip() in shown:
+                terminal.await_text(question)
+                terminal.type(f"{NEW}\n")
+                seen += terminal.passed + question
+        terminal.wait()
+        seen += terminal.shown
+    finally:
+        terminal.close()
+    assert [line.rstrip() for line in seen.rstrip().split("\n")] == shown.split("\n")
