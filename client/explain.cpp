@@ -26,7 +26,6 @@ static void finding_clear(finding *found) {
 }
 G_DEFINE_AUTO_CLEANUP_CLEAR_FUNC(finding, finding_clear)
 
-static constexpr const char *SERVICE = "com.zintor.PrivaneSystem";
 static constexpr const char *POLKIT = "org.freedesktop.PolicyKit1";
 
 static void find(finding *found, verdict allowed, const char *reason) {
@@ -45,8 +44,8 @@ static void find_error(finding *found, const char *who, GError *error) {
 static bool is_shut_out(const session &run, GDBusConnection *bus) {
     g_autoptr(GError) error = nullptr;
     g_autoptr(GVariant) answer = g_dbus_connection_call_sync(
-        bus, SERVICE, "/com/zintor/PrivaneSystem", "org.freedesktop.DBus.Peer", "Ping", nullptr,
-        nullptr, G_DBUS_CALL_FLAGS_NO_AUTO_START, run.line->timeout_ms, nullptr, &error);
+        bus, SERVICE_NAME, SERVICE_PATH, "org.freedesktop.DBus.Peer", "Ping", nullptr, nullptr,
+        G_DBUS_CALL_FLAGS_NO_AUTO_START, run.line->timeout_ms, nullptr, &error);
 
     return answer == nullptr && g_error_matches(error, G_DBUS_ERROR, G_DBUS_ERROR_ACCESS_DENIED);
 }

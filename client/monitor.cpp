@@ -9,8 +9,6 @@
 #include "client/json_output.h"
 #include "privane_system_binding.h"
 
-static constexpr const char *NAME = "com.zintor.PrivaneSystem";
-static constexpr const char *PATH = "/com/zintor/PrivaneSystem";
 static constexpr const char *SIGNAL = "UserDatabaseUpdated";
 
 struct waiting {
@@ -72,7 +70,7 @@ bool run_monitor(const session &run, GError **error) {
     if (bus == nullptr)
         return false;
     g_autoptr(PrivaneSystem) proxy = privane_system__proxy_new_sync(
-        bus, static_cast<GDBusProxyFlags>(flags), NAME, PATH, nullptr, error);
+        bus, static_cast<GDBusProxyFlags>(flags), SERVICE_NAME, SERVICE_PATH, nullptr, error);
     if (proxy == nullptr || !await_subscription(bus, error))
         return false;
 
@@ -83,7 +81,8 @@ bool run_monitor(const session &run, GError **error) {
     (void)g_unix_signal_add(SIGINT, on_end, &wait);
     (void)g_unix_signal_add(SIGTERM, on_end, &wait);
     if (run.line->options[OPTION_NO_LEGEND] == nullptr)
-        (void)std::fprintf(stderr, "Waiting for announcements of %s; Ctrl-C ends this.\n", NAME);
+        (void)std::fprintf(stderr, "Waiting for announcements of %s; Ctrl-C ends this.\n",
+                           SERVICE_NAME);
     g_main_loop_run(loop);
     g_signal_handlers_disconnect_by_data(proxy, &wait);
     g_signal_handlers_disconnect_by_data(bus, &wait);

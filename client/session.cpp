@@ -8,9 +8,6 @@
 #include "client/client_error.h"
 #include "privane_system_binding.h"
 
-static constexpr const char *NAME = "com.zintor.PrivaneSystem";
-static constexpr const char *PATH = "/com/zintor/PrivaneSystem";
-
 GDBusConnection *session_connect(const session &run, GError **error) {
     const char *address = run.line->options[OPTION_ADDRESS];
     GDBusConnection *bus = nullptr;
@@ -43,7 +40,7 @@ GVariant *session_call(const session &run, const GDBusMethodInfo *method, GVaria
     if (bus == nullptr)
         return nullptr;
     g_autoptr(PrivaneSystem) proxy = privane_system__proxy_new_sync(
-        bus, static_cast<GDBusProxyFlags>(flags), NAME, PATH, nullptr, error);
+        bus, static_cast<GDBusProxyFlags>(flags), SERVICE_NAME, SERVICE_PATH, nullptr, error);
     if (proxy == nullptr)
         return nullptr;
     return g_dbus_proxy_call_sync(G_DBUS_PROXY(proxy), method->name, owned, G_DBUS_CALL_FLAGS_NONE,

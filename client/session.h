@@ -7,6 +7,9 @@
 
 struct command;
 
+inline constexpr const char *SERVICE_NAME = "com.zintor.PrivaneSystem";
+inline constexpr const char *SERVICE_PATH = "/com/zintor/PrivaneSystem";
+
 struct session {
     const command_line *line;
     const command *asked;
