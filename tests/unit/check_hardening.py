@@ -1,6 +1,6 @@
 #!/usr/bin/python3
-# tests/unit/check_hardening.py: the service, its libraries and its client are built hardened:
-# check_hardening.py COMPILE_COMMANDS PROGRAM LIBRARY... [PROGRAM]
+# tests/unit/check_hardening.py: the service, its libraries, its client and its checker are built
+# hardened: check_hardening.py COMPILE_COMMANDS PROGRAM LIBRARY... [PROGRAM]
 #
 # Each file must be position-independent, have no executable stack, have its relocations and all of
 # its bindings read-only before it starts, and check its stack frames; and the checked functions of
@@ -16,7 +16,7 @@ from pathlib import Path
 
 OPTIONS = ["-fstack-protector-strong", "-fstack-clash-protection", "-D_FORTIFY_SOURCE=2"]
 OPTIMIZED = re.compile(r" -O(1|2|3|s|g)\b")
-FOLDERS = ("client", "service", "methods", "usermgmt", "platform")
+FOLDERS = ("check", "client", "service", "methods", "usermgmt", "platform")
 
 # What -fcf-protection and -mbranch-protection add to an object file. The second is for who builds
 # the product: machines before ARMv8.3 know none of it.
