@@ -276,11 +276,14 @@ class Unit(unittest.TestCase):
         return re.findall(rf"^{key}=(.*)$", self.text, re.MULTILINE)
 
     def test_systemd_accepts_every_line(self):
-        program = self.value_of("ExecStart")[0].split()[0]
+        programs = [self.value_of(key)[0].split()[0] for key in ("ExecCondition", "ExecStart")]
         with tempfile.TemporaryDirectory() as folder:
-            # Where the program is not installed, that would be the complaint.
+            # Where the programs are not installed, that would be the complaint.
             copy = pathlib.Path(folder) / "privane-system.service"
-            copy.write_text(self.text.replace(program, "/bin/true"), encoding="utf-8")
+            text = self.text
+            for program in programs:
+                text = text.replace(program, "/bin/true")
+            copy.write_text(text, encoding="utf-8")
             result = subprocess.run(
                 ["systemd-analyze", "verify", "--man=no", "--recursive-errors=no", str(copy)],
                 capture_output=True, text=True, check=False)
@@ -293,6 +296,10 @@ class Unit(unittest.TestCase):
         kept = set(" ".join(self.value_of("CapabilityBoundingSet")).split())
         self.assertGreater(len(kept), 0)
         self.assertLessEqual(kept, known)
+
+    def test_looks_at_the_accounts_before_it_starts(self):
+        self.assertEqual(len(self.value_of("ExecCondition")), 1)
+        self.assertRegex(self.value_of("ExecCondition")[0], r"^/[^@ ]*/privane-check --guard$")
 
     def test_runs_the_service_in_the_foreground_under_its_name(self):
         self.assertRegex(self.value_of("ExecStart")[0], r"^/[^@ ]*/privane_system -n$")
