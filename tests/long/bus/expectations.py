@@ -24,14 +24,15 @@ SYSTEM_CODES = {
     "GetActiveNetworkInfo": {28}, "StartService": {29}, "StopService": {30},
     "RestartService": {31}, "ReloadService": {32}, "SetDefaultTarget": {33},
     "ExecuteEthtool": {35}, "ExecuteSmartctl": {36}, "ExecuteLldpcli": {37}}
-# The database's: of an unknown or bad name of a user (3) or a group (4, 7), of a type that forbids
+# The database's: of an unknown or bad name of a user (3) or a group (4, 7; 4 also where the primary
+# group of a user who is not among its members was removed), of a type that forbids
 # it (5, 11, 12), of a name (6) or an ID (13, 14, 17) that is taken, of a password (10), of a user
 # without a primary group or a password too long to hash (16), and of a group that is a primary one
 # (8).
 DATABASE_CODES = {
     "AddUser": {3, 4, 6, 10, 13, 17}, "AddUidUser": {3, 4, 6, 10, 13, 17},
     "AddSystemUser": {4, 6, 13, 16, 17}, "ModifyUser": {4, 5, 10, 12, 16},
-    "ClearUserFields": {3, 5, 16}, "ChpasswdUser": {3, 5, 10, 16}, "RemoveUser": {11},
+    "ClearUserFields": {3, 4, 5, 16}, "ChpasswdUser": {3, 5, 10, 16}, "RemoveUser": {11},
     "GetUser": {3, 16}, "GetGroup": {4}, "AddGroup": {4, 7, 14}, "RemoveGroup": {7, 8, 11}}
 # A field that no line of a file can hold.
 UNWRITABLE = 101
