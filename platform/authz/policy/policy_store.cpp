@@ -44,23 +44,30 @@ static bool is_same_time(const struct timespec &left, const struct timespec &rig
     return left.tv_sec == right.tv_sec && left.tv_nsec == right.tv_nsec;
 }
 
-// To be called after the file was read. The clock is the one that files get their times from; a
-// file system without fractions of a second keeps each for a second.
-static bool is_settled(const struct timespec &changed) {
+// The clock that files get their times from; the beginning of time where it cannot be told.
+static struct timespec file_clock() {
     struct timespec now = {};
 
     if (clock_gettime(CLOCK_REALTIME_COARSE, &now) != 0)
-        return false;
-    if (changed.tv_nsec == 0)
-        return changed.tv_sec + 1 < now.tv_sec;
-    return changed.tv_sec < now.tv_sec ||
-           (changed.tv_sec == now.tv_sec && changed.tv_nsec < now.tv_nsec);
+        return {};
+    return now;
 }
 
-static file_state state_of(const struct stat &seen) {
-    return {
-        true,        is_settled(seen.st_ctim), seen.st_dev, seen.st_ino, seen.st_size, seen.st_mtim,
-        seen.st_ctim};
+// Whether a file that changed then would show another time for a change that came after the given
+// moment. A file system without fractions of a second keeps each for a second.
+static bool is_settled(const struct timespec &changed, const struct timespec &moment) {
+    if (changed.tv_nsec == 0)
+        return changed.tv_sec + 1 < moment.tv_sec;
+    return changed.tv_sec < moment.tv_sec ||
+           (changed.tv_sec == moment.tv_sec && changed.tv_nsec < moment.tv_nsec);
+}
+
+// The clock was asked before the file was: what changes it while it is read has a later time.
+static file_state state_of(const struct stat &seen, const struct timespec &before) {
+    return {true,         is_settled(seen.st_ctim, before),
+            seen.st_dev,  seen.st_ino,
+            seen.st_size, seen.st_mtim,
+            seen.st_ctim};
 }
 
 // A link in the policy file's place is no policy; the account files may be links.
@@ -128,6 +135,7 @@ static bool load_policy(policy_store *store, GError **error) {
     g_autoptr(GString) text = g_string_new(nullptr);
     g_autoptr(GError) cause = nullptr;
     struct stat seen = {};
+    const struct timespec before = file_clock();
 
     g_clear_pointer(&store->rules, policy_free);
     store->policy_file = {};
@@ -140,7 +148,7 @@ static bool load_policy(policy_store *store, GError **error) {
         g_propagate_prefixed_error(error, g_steal_pointer(&cause), "%s:", store->places.policy);
         return false;
     }
-    store->policy_file = state_of(seen);
+    store->policy_file = state_of(seen, before);
     return true;
 }
 
@@ -177,6 +185,7 @@ static void take_line(char *line, GHashTable *wanted, GHashTable *ids) {
 
 // Where the file cannot be read, nobody is known.
 static void look_up(const char *path, GHashTable *wanted, GHashTable *ids, file_state *out_state) {
+    const struct timespec before = file_clock();
     FILE *stream = fopen(path, "re");
     struct stat seen = {};
     char *line = nullptr;
@@ -189,7 +198,7 @@ static void look_up(const char *path, GHashTable *wanted, GHashTable *ids, file_
         while (getline(&line, &size, stream) >= 0)
             take_line(line, wanted, ids);
         if (ferror(stream) == 0)
-            *out_state = state_of(seen);
+            *out_state = state_of(seen, before);
     }
     std::free(line);
     (void)fclose(stream);  // Nothing was written.
