@@ -3,10 +3,10 @@
 
 #include <cstring>
 
-#include "client/display_text.h"
 #include "client/json_output.h"
 #include "client/table_output.h"
 #include "client/verbs.h"
+#include "output/display_text.h"
 
 // Of a record, what says more than its value.
 struct special_label {

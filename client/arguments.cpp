@@ -19,7 +19,7 @@ char *arguments_password(const command_line &line, bool is_new, GError **error) 
     if (given == nullptr)
         return password_ask(is_new ? "New password: " : "Password: ", is_new, error);
     if (!parse_number(given, 0, G_MAXINT, &fd)) {
-        (void)fail_usage(error, "--password-fd takes the number of a descriptor, not '%s'", given);
+        (void)fail_usage(error, "--password-fd takes the number of a descriptor");
         return nullptr;
     }
     return password_read(static_cast<int>(fd), is_new, error);

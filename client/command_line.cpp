@@ -85,6 +85,32 @@ static bool fail_option(int found, char **argv, GError **error) {
     return fail_usage(error, "unknown option %s", argv[optind - 1]);
 }
 
+static const command_option *find_option(const char *name, gsize length) {
+    for (const command_option &row : command_options())
+        if (std::strlen(row.name) == length && std::strncmp(row.name, name, length) == 0)
+            return &row;
+    return nullptr;
+}
+
+// getopt_long takes any beginning of a name for it: "--password=secret" would be a descriptor, and
+// every beginning that somebody uses would bind us.
+static bool check_names(int argc, char **argv, GError **error) {
+    for (int i = 1; i < argc; i++) {
+        if (!g_str_has_prefix(argv[i], "--"))
+            continue;
+        const char *name = argv[i] + 2;
+        const gsize length = std::strcspn(name, "=");
+        if (length == 0)
+            return true;  // What follows are words.
+        const command_option *row = find_option(name, length);
+        if (row == nullptr)
+            return fail_usage(error, "unknown option --%.*s", static_cast<int>(length), name);
+        if (row->value != nullptr && name[length] == '\0')
+            i++;
+    }
+    return true;
+}
+
 static bool read_words(int argc, char **argv, bool on_terminal, command_line *line,
                        GError **error) {
     option long_options[OPTION_COUNT + 1];
@@ -120,7 +146,7 @@ bool command_line_parse(int argc, char **argv, bool on_terminal, command_line *o
             return fail_usage(error, "'%s' is no UTF-8", argv[i]);
     line.words = g_ptr_array_new();
     line.timeout_ms = DEFAULT_TIMEOUT_SECONDS * 1000;
-    if (!read_words(argc, argv, on_terminal, &line, error))
+    if (!check_names(argc, argv, error) || !read_words(argc, argv, on_terminal, &line, error))
         return false;
     *out_line = line;
     line.words = nullptr;

@@ -7,7 +7,7 @@
 
 #include "client/client_error.h"
 #include "client/command_line.h"
-#include "client/display_text.h"
+#include "output/display_text.h"
 
 static constexpr const char *PREFIX = "org.gtk.GDBus.UnmappedGError.Quark._";
 static constexpr const char *CODE_MARK = ".Code";

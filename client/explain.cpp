@@ -7,11 +7,11 @@
 #include <unistd.h>
 
 #include "client/client_error.h"
-#include "client/display_text.h"
 #include "client/json_output.h"
 #include "client/method_action.h"
 #include "client/table_output.h"
 #include "client/verbs.h"
+#include "output/display_text.h"
 
 enum class verdict { YES, NO, UNKNOWN };
 

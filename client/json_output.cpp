@@ -3,6 +3,8 @@
 
 #include <algorithm>
 
+#include "output/display_text.h"
+
 JsonNode *json_of_list(GVariant *results, const char *columns) {
     g_auto(GStrv) names = g_strsplit(columns, " ", -1);
     g_autoptr(JsonArray) rows = json_array_new();
@@ -43,5 +45,6 @@ JsonNode *json_of_results(GVariant *results, const GDBusMethodInfo *method, cons
 
 char *json_format(JsonNode *node, json_mode mode) {
     g_autofree char *text = json_to_string(node, mode == json_mode::PRETTY);
-    return g_strconcat(text, "\n", nullptr);
+    g_autofree char *escaped = display_escape_json(text);
+    return g_strconcat(escaped, "\n", nullptr);
 }

@@ -2,6 +2,7 @@
 #include <cstdio>
 #include <cstdlib>
 
+#include <sys/prctl.h>
 #include <unistd.h>
 
 #include "client/answer_output.h"
@@ -55,6 +56,7 @@ static bool run_command_line(const command_line &line, bool on_terminal, GError 
 }
 
 int main(int argc, char **argv) {
+    (void)prctl(PR_SET_DUMPABLE, 0);  // No core and no debugger of the same user sees a password.
     const bool on_terminal = isatty(STDOUT_FILENO) == 1;
     g_auto(command_line) line = {};
     g_autoptr(GError) error = nullptr;

@@ -3,7 +3,7 @@
 
 #include <algorithm>
 
-#include "client/display_text.h"
+#include "output/display_text.h"
 
 static constexpr const char *UNDERLINED = "\x1b[4m";
 static constexpr const char *PLAIN = "\x1b[0m";

@@ -1,5 +1,5 @@
-// client/display_text.cpp: texts from the bus made fit for a terminal.
-#include "client/display_text.h"
+// output/display_text.cpp: texts of others made fit for a terminal.
+#include "output/display_text.h"
 
 #include <glib.h>
 
@@ -28,6 +28,32 @@ char *display_escape(const char *text, bool keeps_lines) {
             g_string_append_printf(escaped, "\\x%02x", c);
         else
             g_string_append_printf(escaped, c <= 0xffff ? "\\u%04x" : "\\U%08x", c);
+    }
+    return g_string_free(escaped, FALSE);
+}
+
+static void append_json_escape(GString *document, gunichar c) {
+    static constexpr gunichar FIRST_OF_PAIRS = 0x10000;
+
+    if (c < FIRST_OF_PAIRS) {
+        g_string_append_printf(document, "\\u%04x", c);
+        return;
+    }
+    const gunichar rest = c - FIRST_OF_PAIRS;
+    g_string_append_printf(document, "\\u%04x\\u%04x", 0xd800 + (rest >> 10),
+                           0xdc00 + (rest & 0x3ff));
+}
+
+char *display_escape_json(const char *document) {
+    g_autofree char *valid = g_utf8_make_valid(document, -1);
+    GString *escaped = g_string_new(nullptr);
+
+    for (const char *at = valid; *at != '\0'; at = g_utf8_find_next_char(at, nullptr)) {
+        const gunichar c = g_utf8_get_char(at);
+        if (c == '\n' || !must_be_escaped(c))
+            g_string_append_unichar(escaped, c);
+        else
+            append_json_escape(escaped, c);
     }
     return g_string_free(escaped, FALSE);
 }

@@ -12,6 +12,8 @@ from harness.sandbox import start_bus
 from harness.deadline import wait_for
 from harness.service import Service
 
+pytestmark = pytest.mark.polkit
+
 REFUSED, ALLOWED = "polkit refuses it", "polkit allows it"
 CLOSED = "the bus lets only root and the group privane call the service"
 

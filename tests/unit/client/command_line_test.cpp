@@ -26,6 +26,7 @@ class CommandLine : public testing::Test {
             g_strv_builder_add(builder, argument);
         g_strfreev(argv_);
         argv_ = g_strv_builder_end(builder);
+        g_clear_error(&error_);
         return command_line_parse(static_cast<int>(g_strv_length(argv_)), argv_, on_terminal,
                                   &line_, &error_);
     }
@@ -122,8 +123,19 @@ TEST_F(CommandLine, RefusesAnUnknownCharacter) {
     EXPECT_EQ(refusal({"user", "-jx"}), "unknown option -x");
 }
 
-TEST_F(CommandLine, RefusesAnAmbiguousOption) {
-    EXPECT_EQ(refusal({"--passw=1", "--n"}), "unknown option --n");
+// Else a password would be taken for the number of a descriptor, and every beginning bind us.
+TEST_F(CommandLine, RefusesTheBeginningOfAnOption) {
+    EXPECT_EQ(refusal({"--passw=1"}), "unknown option --passw");
+    EXPECT_EQ(refusal({"--password=1234"}), "unknown option --password");
+    EXPECT_EQ(refusal({"user", "--no-leg"}), "unknown option --no-leg");
+}
+
+TEST_F(CommandLine, TakesWordsBehindTheEndOfTheOptions) {
+    EXPECT_EQ(refusal({"--", "--password=1234"}), "accepted");
+}
+
+TEST_F(CommandLine, TakesAValueThatLooksLikeAnOption) {
+    EXPECT_EQ(refusal({"--comment", "--password=1234"}), "accepted");
 }
 
 TEST_F(CommandLine, RefusesAMissingValue) {

@@ -4,8 +4,8 @@
 
 #include <gtest/gtest.h>
 
-#include "client/display_text.h"
 #include "client/table_output.h"
+#include "output/display_text.h"
 
 namespace {
 
