@@ -1,6 +1,7 @@
 // check/account_lines.cpp: reads the lines of the account files, and writes them in memory.
 #include "check/account_lines.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdio>
 #include <cstdlib>
@@ -45,6 +46,9 @@ static void take_entry(const core_file &file, const void *record, account_line *
         const auto *group = static_cast<const struct group *>(record);
         line->name = group->gr_name;
         line->id = group->gr_gid;
+        for (char **member = group->gr_mem; *member != nullptr; member++)
+            line->members.emplace_back(*member);
+        std::sort(line->members.begin(), line->members.end());
     }
 }
 

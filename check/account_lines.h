@@ -14,9 +14,10 @@ struct account_line {
     std::string text;  // without its end
     // What the C library's reader, which the service reads with, takes it for.
     bool is_entry = false;
-    std::string name = {};      // of an entry; a blank before it is not part of it
-    guint32 id = 0;             // of a user or a group
-    guint32 primary_group = 0;  // of a user
+    std::string name = {};                  // of an entry; a blank before it is not part of it
+    guint32 id = 0;                         // of a user or a group
+    guint32 primary_group = 0;              // of a user
+    std::vector<std::string> members = {};  // of a group, in alphabetical order
 
     std::string_view field(std::size_t index) const;  // from 0; empty where there is none
     std::size_t field_count() const;

@@ -3,8 +3,8 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <iterator>
 #include <map>
-#include <optional>
 #include <set>
 
 #include "check/hash_cost.h"
@@ -35,6 +35,7 @@ class line_review {
     void add(gravity weight, const char *kind, int row, const account_line &line, std::string text,
              bool has_account = true);
     void review_others(int row);
+    void review_malformed(int row, const account_line &line);
     void review_passwd();
     void review_shadow();
     void review_order();
@@ -52,12 +53,23 @@ class line_review {
     findings *out_;
     names shadowed_;  // the users that keep a line in the shadow file
     names users_;     // those with a line in passwd
+    names shadow_names_;
 };
 
 void line_review::add(gravity weight, const char *kind, int row, const account_line &line,
                       std::string text, bool has_account) {
     out_->add({weight, kind, core_file_table[row].path, line.number, has_account ? line.name : "",
                std::move(text)});
+}
+
+// Nobody can log in by it, but it may have been meant for an account.
+void line_review::review_malformed(int row, const account_line &line) {
+    const bool looks_like_account = row != CORE_FILE_ROW_SHADOW && !line.field(0).empty() &&
+                                    line.field_count() >= std::size(group_fields);
+    out_->add({looks_like_account ? gravity::LOSS : gravity::CHANGE, "malformed-line",
+               core_file_table[row].path, line.number,
+               looks_like_account ? std::string(line.field(0)) : "",
+               "no entry by the C library's rules; a write drops the line"});
 }
 
 // Lines that are no entries, and a last line without its end.
@@ -72,33 +84,25 @@ void line_review::review_others(int row) {
         else if (line.text[first] == '#')
             add(gravity::CHANGE, "comment", row, line, "a comment, which a write drops", false);
         else
-            add(gravity::CHANGE, "malformed-line", row, line,
-                "no entry by the C library's rules; a write drops the line", false);
+            review_malformed(row, line);
     }
     if (!files_.has_last_end[row])
         add(gravity::CHANGE, "no-line-end", row, files_.lines[row].back(),
             "the last line has no end; a write adds it", false);
 }
 
-static std::vector<std::string> sorted_list(std::string_view text) {
-    std::vector<std::string> list;
-    while (!text.empty()) {
-        const std::size_t end = text.find(',');
-        if (end != 0)
-            list.emplace_back(text.substr(0, end));
-        text.remove_prefix(end != text.npos ? end + 1 : text.size());
-    }
-    std::sort(list.begin(), list.end());
-    return list;
-}
-
 // What becomes of a field, in words; empty where it means the same.
-static std::string change_of_field(int row, std::size_t index, std::string_view old,
+static std::string change_of_field(int row, std::size_t index, const account_line &line,
                                    std::string_view written) {
+    const std::string_view old = line.field(index);
     if (old == written)
         return "";
-    if (row == CORE_FILE_ROW_GROUP && index == MEMBERS)  // of a set, whose order means nothing
-        return sorted_list(old) != sorted_list(written) ? "each member is listed once" : "";
+    if (row == CORE_FILE_ROW_GROUP && index == MEMBERS) {  // of a set, whose order means nothing
+        const auto &members = line.members;
+        const bool is_repeated =
+            std::adjacent_find(members.begin(), members.end()) != members.end();
+        return is_repeated ? "each member is listed once" : "";
+    }
     const std::string name = field_names[row][index];
     if (index != PASSWORD)
         return "the " + name + " \"" + std::string(old) + "\" becomes \"" + std::string(written) +
@@ -119,7 +123,7 @@ void line_review::compare(int row, const account_line &line, const void *record)
     std::string changes;
     bool is_ageing = row == CORE_FILE_ROW_SHADOW;
     for (std::size_t i = 0; i < field_names[row].size(); i++) {
-        const std::string change = change_of_field(row, i, line.field(i), written.field(i));
+        const std::string change = change_of_field(row, i, line, written.field(i));
         if (change.empty())
             continue;
         is_ageing = is_ageing && i >= FIRST_AGE;
@@ -133,10 +137,7 @@ void line_review::compare(int row, const account_line &line, const void *record)
 }
 
 void line_review::explain_lost_user(const account_line &line) {
-    const bool has_shadow = std::any_of(
-        files_.lines[CORE_FILE_ROW_SHADOW].begin(), files_.lines[CORE_FILE_ROW_SHADOW].end(),
-        [&line](const account_line &other) { return other.is_entry && other.name == line.name; });
-    if (line.field(PASSWORD) == ELSEWHERE && !has_shadow)
+    if (line.field(PASSWORD) == ELSEWHERE && !shadow_names_.contains(line.name))
         add(gravity::LOSS, "no-shadow-line", CORE_FILE_ROW_PASSWD, line,
             "a write drops the user: its password is in the shadow file, which has no line of it");
     else if (group_database_find_gid(&ctx_->group_db, line.primary_group) == nullptr)
@@ -161,14 +162,21 @@ void line_review::explain_lost_group(const account_line &line) {
             "a write drops this line: the group stands in an earlier one");
 }
 
+static bool is_of(const account_line &line, const internal_user *user) {
+    return line.name == user->name && line.id == user->uid && line.primary_group == user->gid;
+}
+
+static bool is_of(const account_line &line, const internal_group *group) {
+    return line.name == group->name && line.id == group->gid;
+}
+
 // What is loaded is a part of the entries, in their order.
 template <typename record>
-static const record *next_if(const GPtrArray *loaded, guint *at, const account_line &line,
-                             guint32 record::*id) {
+static const record *next_if(const GPtrArray *loaded, guint *at, const account_line &line) {
     if (*at >= loaded->len)
         return nullptr;
     const auto *found = static_cast<const record *>(loaded->pdata[*at]);
-    if (line.name != found->name || line.id != found->*id)
+    if (!is_of(line, found))
         return nullptr;
     (*at)++;
     return found;
@@ -180,7 +188,7 @@ void line_review::review_passwd() {
         if (!line.is_entry)
             continue;
         users_.insert(line.name);
-        const internal_user *user = next_if(ctx_->user_db.entries, &at, line, &internal_user::uid);
+        const internal_user *user = next_if<internal_user>(ctx_->user_db.entries, &at, line);
         if (user == nullptr) {
             explain_lost_user(line);
             continue;
@@ -216,14 +224,15 @@ void line_review::review_shadow() {
 
 // The lines of the shadow file follow those of passwd once they are written.
 void line_review::review_order() {
+    names seen;
     std::vector<std::string> before;
     for (const account_line &line : files_.lines[CORE_FILE_ROW_SHADOW])
-        if (line.is_entry && shadowed_.contains(line.name) &&
-            std::find(before.begin(), before.end(), line.name) == before.end())
+        if (line.is_entry && shadowed_.contains(line.name) && seen.insert(line.name).second)
             before.push_back(line.name);
+    seen.clear();
     std::vector<std::string> after;
     for (const internal_user *user : records<const internal_user>(ctx_->user_db.entries))
-        if (user->shadowed && std::find(after.begin(), after.end(), user->name) == after.end())
+        if (user->shadowed && seen.insert(user->name).second)
             after.emplace_back(user->name);
     if (before != after)
         out_->add(
@@ -232,7 +241,7 @@ void line_review::review_order() {
 }
 
 void line_review::review_members(const account_line &line) {
-    for (const std::string &member : sorted_list(line.field(MEMBERS)))
+    for (const std::string &member : line.members)
         if (!users_.contains(member))
             add(gravity::NOTICE, "unknown-member", CORE_FILE_ROW_GROUP, line,
                 "lists \"" + member +
@@ -245,8 +254,7 @@ void line_review::review_groups() {
     for (const account_line &line : files_.lines[CORE_FILE_ROW_GROUP]) {
         if (!line.is_entry)
             continue;
-        const internal_group *group =
-            next_if(ctx_->group_db.entries, &at, line, &internal_group::gid);
+        const internal_group *group = next_if<internal_group>(ctx_->group_db.entries, &at, line);
         if (group == nullptr) {
             explain_lost_group(line);
             continue;
@@ -291,6 +299,8 @@ void line_review::review_root() {
 }
 
 void line_review::run() {
+    for (const account_line &line : files_.lines[CORE_FILE_ROW_SHADOW])
+        shadow_names_.insert(line.name);
     for (int row = 0; row < CORE_FILE_COUNT; row++)
         review_others(row);
     review_passwd();

@@ -73,7 +73,7 @@ static int guard(const findings &found) {
     if (!found.has(gravity::LOSS))
         return 0;
     if (access(ACCOUNT_LOSS_MARKER, F_OK) == 0) {
-        (void)std::puts(ACCOUNT_LOSS_MARKER " says that this is wanted.");
+        (void)std::fputs(ACCOUNT_LOSS_MARKER " says that this is wanted.\n", stderr);
         return 0;
     }
     (void)std::fputs(
@@ -125,6 +125,10 @@ int main(int argc, char **argv) {
     if (!parse(argc, argv, &chosen))
         return WRONG_CALL;
     (void)prctl(PR_SET_DUMPABLE, 0);  // it holds every hash
+    if (geteuid() != 0) {
+        (void)std::fputs("privane-check: only root may read the files\n", stderr);
+        return WRONG_CALL;
+    }
     if (chosen.root != nullptr && (chroot(chosen.root) != 0 || chdir("/") != 0)) {
         (void)std::fprintf(stderr, "privane-check: %s: %m\n", chosen.root);
         return WRONG_CALL;

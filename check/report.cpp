@@ -6,21 +6,7 @@
 
 #include <json-glib/json-glib.h>
 
-// A line each, whatever stands in a file: a name may hold what a terminal obeys.
-static std::string shown(const std::string &text) {
-    g_autofree char *valid = g_utf8_make_valid(text.c_str(), static_cast<gssize>(text.size()));
-    std::string line;
-    for (const char *at = valid; *at != '\0'; at = g_utf8_next_char(at)) {
-        const gunichar character = g_utf8_get_char(at);
-        if (g_unichar_iscntrl(character) != FALSE) {
-            g_autofree char *escaped = g_strdup_printf("\\x%02x", character);
-            line += escaped;
-        } else {
-            line.append(at, static_cast<std::size_t>(g_utf8_next_char(at) - at));
-        }
-    }
-    return line;
-}
+#include "output/display_text.h"
 
 void print_text(const findings &found) {
     for (const finding &one : found.all()) {
@@ -30,7 +16,8 @@ void print_text(const findings &found) {
         line += std::string(": ") + gravity_name(one.weight) + ": " + one.kind + ": ";
         if (!one.account.empty())
             line += "'" + one.account + "': ";
-        (void)std::puts(shown(line + one.text).c_str());
+        g_autofree char *shown = display_escape((line + one.text).c_str(), false);
+        (void)std::puts(shown);
     }
 }
 
@@ -76,5 +63,6 @@ void print_json(const findings &found, bool is_pretty) {
 
     g_autoptr(JsonNode) root = json_builder_get_root(builder);
     g_autofree char *text = json_to_string(root, is_pretty ? TRUE : FALSE);
-    (void)std::puts(text);
+    g_autofree char *shown = display_escape_json(text);
+    (void)std::puts(shown);
 }

@@ -3,6 +3,7 @@ import json
 import os
 import shutil
 import subprocess
+import time
 from collections.abc import Iterator
 from pathlib import Path
 
@@ -89,6 +90,15 @@ PASSWD_CASES = {
 }
 
 
+@pytest.mark.parametrize("line", ("carol:x:1O03:100:Carol:/:/bin/sh", "carol:x:4294967296:100:::"))
+def test_a_malformed_line_that_looks_like_an_account(line: str) -> None:
+    write(GOOD_PASSWD + line + "\n", GOOD_SHADOW + "carol:$5$salt$hash:1:0:99999:7:0::\n")
+    done = check("--guard")
+    assert done.stdout == ("/etc/passwd:3: loss: malformed-line: 'carol': no entry by the C library's "
+                           "rules; a write drops the line\n")
+    assert done.returncode == LOSS
+
+
 @pytest.mark.parametrize("kind", PASSWD_CASES)
 def test_a_line_of_passwd(kind: str) -> None:
     line, text, status = PASSWD_CASES[kind]
@@ -163,6 +173,34 @@ def test_the_order_of_members_means_nothing() -> None:
                     for number, name in enumerate(members[1:], 2000))
     write(GOOD_PASSWD + users, group=GOOD_GROUP + f"more:x:101:{','.join(reversed(members))}\n")
     assert told() == []
+
+
+def test_a_blank_before_a_member_means_nothing() -> None:
+    """The C library leaves it out."""
+    write(GOOD_PASSWD + "bob:*:1002:100::/:/bin/sh\n", group=GOOD_GROUP + "more:x:101:alice, bob\n")
+    assert told() == []
+
+
+def test_of_two_lines_of_a_user_the_one_that_is_kept_is_told_apart() -> None:
+    write(GOOD_PASSWD + "bob:*:1002:4242::/:/bin/sh\nbob:*:1002:100::/:/bin/sh\n")
+    assert told() == [
+        "/etc/passwd:3: loss: no-primary-group: 'bob': a write drops the user: no group that is kept "
+        "has its GID 4242",
+        "/etc/passwd:4: notice: repeated-name: 'bob': has the name of line 3; a change reaches the "
+        "last of them",
+        "/etc/passwd:4: notice: repeated-id: 'bob': has the UID of line 3"]
+
+
+def test_as_many_users_as_there_can_be() -> None:
+    """The unit waits for it: the time grows with their number, not with its square."""
+    many = range(1000, 60001)
+    write("root:x:0:0:root:/root:/bin/sh\n" + "".join(f"u{uid}:x:{uid}:100:::\n" for uid in many),
+          "root:*:19000:0:99999:7:0::\n" + "".join(f"u{uid}:*:1:0:99999:7:0::\n" for uid in many))
+    begin = time.monotonic()
+    assert told() == ["/etc/group:2: notice: unknown-member: 'users': lists \"alice\", who has no "
+                      "account: an account of that name would be a member, and the group cannot be "
+                      "removed"]
+    assert time.monotonic() - begin < 10
 
 
 def test_a_name_that_stands_twice() -> None:
@@ -290,7 +328,7 @@ def test_the_guard_of_the_unit() -> None:
     wanted = check("--guard")
     MARKER.unlink()
     assert wanted.returncode == 0
-    assert wanted.stdout.endswith(f"{MARKER} says that this is wanted.\n")
+    assert wanted.stderr == f"{MARKER} says that this is wanted.\n"
 
 
 def test_the_files_of_an_image(tmp_path: Path) -> None:
@@ -304,6 +342,20 @@ def test_the_files_of_an_image(tmp_path: Path) -> None:
     missing = check("--root=/nosuch")
     assert (missing.returncode, missing.stderr) == (
         USAGE, "privane-check: /nosuch: No such file or directory\n")
+
+
+def test_json_is_valid_whatever_a_name_holds() -> None:
+    write(GOOD_PASSWD + "a\x1fb\u009bc:*:70000:100::/:/bin/sh\n")
+    done = check("--json=short")
+    assert json.loads(done.stdout)["findings"][0]["account"] == "a\x1fb\u009bc"
+    assert "\x1f" not in done.stdout and "\u009b" not in done.stdout
+
+
+def test_only_root_may_look(accounts: AccountFiles) -> None:
+    done = subprocess.run(["setpriv", "--reuid=701", "--clear-groups", "/usr/sbin/privane-check"],
+                          capture_output=True, text=True, check=False)
+    assert (done.returncode, done.stdout, done.stderr) == (
+        USAGE, "", "privane-check: only root may read the files\n")
 
 
 @pytest.mark.parametrize(("words", "text"), (
