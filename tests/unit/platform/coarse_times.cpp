@@ -2,6 +2,7 @@
 #include "tests/unit/platform/coarse_times.h"
 
 #include <ctime>
+#include <utility>
 
 #include <sys/stat.h>
 
@@ -9,6 +10,14 @@ static long step = 1;
 
 void set_time_step(long nanoseconds) {
     step = nanoseconds;
+}
+
+static std::function<void()> next_act;
+static time_t next_delay;
+
+void at_next_clock(std::function<void()> act, time_t seconds_later) {
+    next_act = std::move(act);
+    next_delay = seconds_later;
 }
 
 static void cut(struct timespec *time) {
@@ -41,8 +50,13 @@ int __wrap_fstatat64(int folder, const char *path, struct stat64 *seen, int flag
 }
 
 int __wrap_clock_gettime(clockid_t clock, struct timespec *time) {
-    const int result = __real_clock_gettime(clock, time);
+    const std::function<void()> act = std::exchange(next_act, nullptr);
+    const time_t delay = std::exchange(next_delay, 0);
 
+    if (act)
+        act();
+    const int result = __real_clock_gettime(clock, time);
+    time->tv_sec += delay;
     if (result == 0)
         cut(time);
     return result;

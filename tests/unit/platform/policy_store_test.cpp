@@ -2,6 +2,7 @@
 // once.
 #include "platform/authz/policy/policy_store.h"
 
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -198,6 +199,16 @@ TEST_F(PolicyStore, EveryChangeInOneMomentCounts) {
             ASSERT_EQ(ask(701), "yes") << step << " " << i;
         }
     }
+}
+
+// Of two changes in the same second, the later one comes right after the file was read, and the
+// second is over when the clock is asked.
+TEST_F(PolicyStore, ChangeWhileItIsReadCounts) {
+    set_time_step(1'000'000'000L);
+    grant("users=clerk", "x.y");
+    at_next_clock([this] { grant("users=clerk", "x.z"); }, 3);
+    (void)ask(701);
+    EXPECT_EQ(ask(701), "no");
 }
 
 TEST_F(PolicyStore, EveryChangeOfTheAccountsCountsAtOnce) {
