@@ -6,6 +6,8 @@
 struct internal_user {
     guint32 type;
     gboolean shadowed;  // the password lives in the shadow file, the passwd file carries "x"
+    // The strings but the password are freed and replaced only by the functions below: they stand
+    // in a block of their own or in the record's.
     char *name;
     char *password;  // a crypt hash or whatever the field held; may be absent; wiped when freed
     char *gecos;     // may be absent

@@ -223,6 +223,7 @@ gboolean init_populate_user_database(const usermgmt_ctx *ctx, user_database *use
         return TRUE;
     g_autoptr(GHashTable) gids = gid_index(ctx);
     shadow_lines shadow(ctx->cached[CORE_FILE_ROW_SHADOW].data);
+    // A user who is left out is not in the database to be found: the name may have been asked for.
     bool all_loaded = true;
     for (const struct passwd *line : records<const struct passwd>(cached.data)) {
         g_autoptr(GError) cause = nullptr;

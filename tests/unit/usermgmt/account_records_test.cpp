@@ -34,22 +34,34 @@ TEST(AccountRecords, UserPasswordIsWipedBeforeItIsFreed) {
     EXPECT_EQ(watch.readable(), lines());
 }
 
-TEST(AccountRecords, CopyOfAUserKeepsEveryField) {
+// Every field is another's.
+static internal_user *new_whole_user() {
     internal_user *user = new_user({.name = "alice", .password = "$5$salt$secrethash"});
-    const internal_user original = *user;
+    user->type = 4;
+    user->shadowed = TRUE;
+    user->gecos = g_strdup("Alice");
+    user->home = g_strdup("/home/alice");
+    user->shell = g_strdup("/bin/false");
+    user->uid = 1001;
+    user->gid = 100;
+    user->last_change = 1'700'000'000;
+    return user;
+}
+
+TEST(AccountRecords, CopyOfAUserKeepsEveryField) {
+    internal_user *user = new_whole_user();
     g_autoptr(internal_user) copy = internal_user_copy(user);
-    EXPECT_NE(copy->name, original.name);
-    EXPECT_NE(copy->password, original.password);
-    EXPECT_STREQ(copy->name, user->name);
-    EXPECT_STREQ(copy->password, user->password);
-    EXPECT_STREQ(copy->gecos, user->gecos);
-    EXPECT_STREQ(copy->home, user->home);
-    EXPECT_STREQ(copy->shell, user->shell);
-    EXPECT_EQ(copy->uid, user->uid);
-    EXPECT_EQ(copy->gid, user->gid);
-    EXPECT_EQ(copy->last_change, user->last_change);
     internal_user_free(user);
+    EXPECT_EQ(copy->type, 4U);
+    EXPECT_EQ(copy->shadowed, TRUE);
     EXPECT_STREQ(copy->name, "alice");
+    EXPECT_STREQ(copy->password, "$5$salt$secrethash");
+    EXPECT_STREQ(copy->gecos, "Alice");
+    EXPECT_STREQ(copy->home, "/home/alice");
+    EXPECT_STREQ(copy->shell, "/bin/false");
+    EXPECT_EQ(copy->uid, 1001U);
+    EXPECT_EQ(copy->gid, 100U);
+    EXPECT_EQ(copy->last_change, 1'700'000'000);
 }
 
 TEST(AccountRecords, CopyOfAnEmptyUserIsEmpty) {
@@ -62,20 +74,27 @@ TEST(AccountRecords, CopyOfAnEmptyUserIsEmpty) {
     EXPECT_EQ(copy->shell, nullptr);
 }
 
+static bool is_in_block(const internal_user *user, const char *text) {
+    const char *begin = reinterpret_cast<const char *>(user + 1);
+    return text >= begin && text < begin + user->room;
+}
+
 // In the block of the record, in one of its own, and absent, one after the other.
 TEST(AccountRecords, TextsAreReplacedWhereverTheyStand) {
-    internal_user *user = new_user({.name = "alice"});
-    g_autoptr(internal_user) copy = internal_user_copy(user);
-    internal_user_free(user);
+    internal_user *user = new_whole_user();
     for (char *internal_user::*text :
          {&internal_user::name, &internal_user::gecos, &internal_user::home, &internal_user::shell})
-        for (const char *wanted : {"longer than what stood there before", "", "x"}) {
-            internal_user_replace_text(copy, text, wanted);
-            EXPECT_STREQ(copy->*text, wanted);
+        for (const char *first :
+             {"longer than what stood there before", "", "x", static_cast<const char *>(nullptr)}) {
+            g_autoptr(internal_user) copy = internal_user_copy(user);
+            ASSERT_TRUE(is_in_block(copy, copy->*text));
+            for (const char *wanted : {first, "another", static_cast<const char *>(nullptr), "y"}) {
+                internal_user_replace_text(copy, text, wanted);
+                EXPECT_STREQ(copy->*text, wanted);
+            }
+            EXPECT_STREQ(copy->password, "$5$salt$secrethash");
         }
-    internal_user_replace_text(copy, &internal_user::gecos, nullptr);
-    EXPECT_EQ(copy->gecos, nullptr);
-    EXPECT_STREQ(copy->shell, "x");
+    internal_user_free(user);
 }
 
 TEST(AccountRecords, PasswordOfACopyIsWipedBeforeItIsFreed) {

@@ -34,6 +34,22 @@ static std::string hash_of(const std::vector<named_hash> &shadow, const std::str
     return "";
 }
 
+// The first of two lines of a user is left out, since its group is missing, after its shadow line
+// was passed: the second line's is the first one all the same.
+TEST_F(ShadowOrder, UserWhoWasLeftOutDoesNotUseUpAShadowLine) {
+    write("passwd", "a:x:1:99:::\na:x:1:0:::\nb:x:2:0:::\n");
+    write("shadow", "a:first:1::::::\na:second:1::::::\nb:third:1::::::\n");
+    write("group", "root:x:0:\n");
+    EXPECT_EQ(loaded(), (lines{"a first", "b third"}));
+}
+
+TEST_F(ShadowOrder, NameThatStandsTwiceInBothFilesHasTheFirstLineTwice) {
+    write("passwd", "a:x:1:0:::\na:x:2:0:::\nb:x:3:0:::\n");
+    write("shadow", "a:first:1::::::\na:second:1::::::\nb:third:1::::::\n");
+    write("group", "root:x:0:\n");
+    EXPECT_EQ(loaded(), (lines{"a first", "a first", "b third"}));
+}
+
 // Few names, so that they come twice or miss; mostly in order, so that both ways of finding a line
 // are gone. Group 99 does not exist: its users are left out after their shadow line was found.
 TEST_F(ShadowOrder, TheFirstLineOfTheNameCounts) {
