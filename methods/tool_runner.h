@@ -29,13 +29,13 @@ G_DEFINE_AUTO_CLEANUP_CLEAR_FUNC(tool_result, tool_result_clear)
 
 // Runs the tool to its end, however long that takes and however much it prints. What it leaves
 // behind with a captured output still open is waited for too, and prints into the same text.
-// False, with an error of GLib's spawn domain and the wait
-// status at -1, when it could not be started. The vector ends with a null.
+// False, with an error of GLib's spawn domain and the wait status at -1, when it could not be
+// started. The vector ends with a null.
 bool run_tool(const char *const *argv, tool_capture capture, tool_result *result, GError **error);
 
 // The same with tool_capture::OUTPUT, in a time that does not grow with the service's memory. The
-// tool then ignores SIGPIPE, as the service does. A tool that cannot be started so is tried once
-// more by run_tool, whose error tells why.
+// tool then ignores SIGPIPE, as the service does. Where that fails, run_tool tries once more, whose
+// error tells why: for tools that may run twice.
 bool run_tool_without_fork(const char *const *argv, tool_result *result, GError **error);
 
 // Whether the tool ended by itself, with status 0.

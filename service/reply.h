@@ -10,6 +10,7 @@
 char *sendable_text(const char *text);
 
 // The same for each string of a list, in its place: lists are long, and nearly all of it is valid.
+// The list is one for g_strfreev, not null; an invalid string is freed and replaced.
 void make_sendable(char **list);
 
 // Bytes that a string, or an array of strings, takes in a message at most.

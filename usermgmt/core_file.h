@@ -26,7 +26,8 @@ struct core_file {
     const char *name;
     const char *path;
     // A heap copy of the stream's next C-library record; null at the end of the file, where errno
-    // is ENOENT, and on a failure, where errno is its cause.
+    // is ENOENT, and on a failure, where errno is its cause. Null also ends the reading: the room
+    // of the lines is wiped and freed then.
     gpointer (*fetch)(FILE *stream);
     // Writes one record of a database. Negative on failure, with errno set.
     int (*write)(const void *record, FILE *stream);

@@ -1,7 +1,8 @@
 // usermgmt/core_file_records.h: the lines of the three account files, internal to usermgmt.
 //
 // The functions behind the rows of core_file_table. Formats: passwd(5), shadow(5), group(5); the
-// C library's own readers and writers do the work.
+// C library's own readers and writers do the work; the readers in their form for a room of the
+// caller's, since with their own they take the square of a line's length.
 #pragma once
 
 #include <cstdio>
