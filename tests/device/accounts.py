@@ -6,8 +6,14 @@ from camera.machine import Camera
 
 USER_RANGES = ((0, 0), (1, 499), (500, 999), (1000, 60000), (65534, 65534))
 GROUP_RANGES = ((0, 0), (1, 499), (500, 999), (65534, 65534), (60001, 60010))
+# By it the maker of a device accepts that a start with these files will lose some.
+LOSS_MARKER = "/etc/privane/accept-account-loss"
 # Temporary files of a rewriting, and whatever else is named after one of them.
 LIST_BESIDE = f"ls -dA /etc/passwd* /etc/shadow* /etc/group* {DIGEST_FILE.rpartition('/')[0]}/*"
+
+
+def accept_loss(camera: Camera) -> None:
+    camera.run(["install", "-D", "-m", "644", "/dev/null", LOSS_MARKER]).check()
 
 
 @dataclass(frozen=True)

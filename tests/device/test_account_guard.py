@@ -1,12 +1,12 @@
 """tests/device/test_account_guard.py: the unit does not start the service where it would lose
 accounts, unless the maker of the device wants that."""
+from accounts import LOSS_MARKER, accept_loss
 from calls import ask, owner_pid, wait_for_owner
 from camera.machine import Camera
 from camera.tour import UNIT
 from drop_in import unit_properties
 
 HUMAN = "human:x:70000:100::/home/human:/bin/sh"
-MARKER = "/etc/privane/accept-account-loss"
 
 
 def test_the_service_of_the_camera_would_lose_nothing(camera: Camera) -> None:
@@ -21,9 +21,10 @@ def test_a_device_that_would_lose_an_account(camera: Camera) -> None:
     assert owner_pid(camera) == 0
     journal = camera.run(["journalctl", "-b", "-o", "cat", "-u", UNIT]).check().out
     assert "loss: no-shadow-line: 'human': a write drops the user" in journal
-    assert f"The maker of a device who wants that makes the file {MARKER}." in journal
+    assert f"The maker of a device who wants that makes the file {LOSS_MARKER}." in journal
     assert HUMAN in camera.run(["cat", "/etc/passwd"]).check().out
 
-    camera.run(f"touch {MARKER}; systemctl restart {UNIT}").check()
+    accept_loss(camera)
+    camera.run(["systemctl", "restart", UNIT]).check()
     wait_for_owner(camera)
     assert ask(camera, "CheckUser", "'human'") == (False,)

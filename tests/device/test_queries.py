@@ -1,6 +1,6 @@
 """tests/device/test_queries.py: what the account queries answer equals the camera's own files."""
 import pytest
-from accounts import fingerprint, groups_of, users_of
+from accounts import accept_loss, fingerprint, groups_of, users_of
 from calls import QUERIES, BusError, ask, ask_about_each
 from camera.machine import Camera
 from camera.tour import UNIT
@@ -30,6 +30,7 @@ def add_accounts_of_all_kinds(camera: Camera) -> None:
     added = {"/etc/group": MORE_GROUPS, "/etc/passwd": MORE_USERS, "/etc/shadow": shadow}
     for path, lines in added.items():
         camera.run(f"cat >>{path} <<'END'\n{lines}END").check()
+    accept_loss(camera)
     # The files are read at start only.
     camera.run(["systemctl", "restart", UNIT]).check()
 

@@ -4,6 +4,7 @@ import json
 import os
 import pty
 import select
+import signal
 import subprocess
 import termios
 import time
@@ -85,6 +86,9 @@ class Terminal:
         self.passed = ""
 
         def take_terminal() -> None:
+            # Whoever runs the tests may ignore some, which would be inherited.
+            for number in (signal.SIGHUP, signal.SIGINT, signal.SIGQUIT, signal.SIGTERM):
+                signal.signal(number, signal.SIG_DFL)
             fcntl.ioctl(slave, termios.TIOCSCTTY, 0)
         self.process = subprocess.Popen([*program, *words], stdin=slave, stdout=slave, stderr=slave,
                                         env=surroundings(**(environment or {})),
