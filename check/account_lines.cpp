@@ -12,7 +12,7 @@
 
 static std::size_t end_of_field(std::string_view text) {
     const std::size_t colon = text.find(':');
-    return colon != text.npos ? colon : text.size();
+    return colon != std::string_view::npos ? colon : text.size();
 }
 
 std::string_view account_line::field(std::size_t index) const {
@@ -78,7 +78,7 @@ bool read_account_lines(const core_file &file, std::vector<account_line> *out_li
     for (unsigned number = 1; !rest.empty(); number++) {
         const std::size_t end = rest.find('\n');
         out_lines->push_back(parse(file, number, rest.substr(0, end)));
-        rest.remove_prefix(end != rest.npos ? end + 1 : rest.size());
+        rest.remove_prefix(end != std::string_view::npos ? end + 1 : rest.size());
     }
     return true;
 }

@@ -78,7 +78,7 @@ void line_review::review_others(int row) {
         if (line.is_entry)
             continue;
         const std::size_t first = line.text.find_first_not_of(" \t");
-        if (first == line.text.npos)
+        if (first == std::string::npos)
             add(gravity::CHANGE, "blank-line", row, line, "a blank line, which a write drops",
                 false);
         else if (line.text[first] == '#')
