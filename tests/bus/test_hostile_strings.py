@@ -9,7 +9,7 @@ from typing import Any, Callable, Iterator
 
 import pytest
 
-from harness.account_model import digest_line
+from harness.account_rules import digest_line
 from harness.accounts import AccountFiles
 from harness.modelled_stage import ModelledStage
 from harness.passwords import MARK, NEW, OLD

@@ -7,8 +7,8 @@ import copy
 import unicodedata
 from typing import Any, Iterable, Sequence
 
-from harness.account_model import (AccountModel, ModelGroup, ModelUser, Outcome, Refused,
-                                   on_one_line)
+from harness.account_model import AccountModel
+from harness.account_rules import ModelGroup, ModelUser, Outcome, Refused, on_one_line
 from harness.accounts import GROUP, PASSWD, SHADOW, AccountFiles
 from harness.changing_accounts import GROUP_TEXT, PASSWD_TEXT, SHADOW_TEXT, is_today
 from harness.passwords import OLD, OLD_HASH, is_hash_of

@@ -2,8 +2,8 @@
 import copy
 from typing import Any
 
-from harness.account_model import (AccountModel, ModelGroup, ModelUser, Outcome, Refused,
-                                   on_one_line)
+from harness.account_model import AccountModel
+from harness.account_rules import ModelGroup, ModelUser, Outcome, Refused, on_one_line
 from harness.accounts import GROUP, PASSWD, SHADOW
 from harness.stage_fixtures import DIGEST_FILE
 from kept_files import (BOOT_BLOCK, PARAMETERS, Hashes, Version, boot_text, read_version,

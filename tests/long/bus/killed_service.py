@@ -5,7 +5,7 @@ import signal
 from typing import Any, Callable
 
 from account_history import REPEATED, Call, History
-from harness.account_model import digest_line
+from harness.account_rules import digest_line
 from harness.accounts import AccountFiles
 from harness.bus import Bus, BusError, domain_error
 from harness.changing_accounts import write_changing_accounts

@@ -7,7 +7,7 @@ from typing import Any, Callable
 
 from gi.repository import Gio, GLib
 
-from harness.account_model import Refused
+from harness.account_rules import Refused
 from harness.bus import INTERFACE, NAME, PATH, Bus, BusError, domain_error
 from harness.deadline import wait_for
 from harness.modelled_stage import ModelledStage
