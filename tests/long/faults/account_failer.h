@@ -30,10 +30,10 @@ class account_failer {
         int failing_row = -1;
         const char *answer = nullptr;  // as a case has it; null where chance decides
     };
-    void strike_all(const start &from, guint64 amount);
-    void strike_all_of_open(const start &from, guint64 amount);
+    void strike_all(const start &from);
+    void strike_all_of_open(const start &from);
     // The disk goes bad at each call that writes, stays so for the next change, and is mended.
-    void spoil_disk(const start &from, guint64 amount);
+    void spoil_disk(const start &from);
     void run_by_chance(random_operations *chance);
 
   private:

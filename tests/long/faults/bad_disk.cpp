@@ -80,7 +80,7 @@ std::string account_failer::outlive_bad_disk(usermgmt_ctx *ctx, int index, int e
     return "";
 }
 
-void account_failer::spoil_disk(const start &from, guint64 amount) {
+void account_failer::spoil_disk(const start &from) {
     from_ = from;
     if (!rehearse())
         return;
@@ -88,7 +88,7 @@ void account_failer::spoil_disk(const start &from, guint64 amount) {
         for (const int error : disk_errors) {
             const bool fails = rehearsal_->calls[index].writes ||
                                (error == EROFS && rehearsal_->calls[index].may_write);
-            if (!fails || report_->figure("faults") >= amount || report_->is_hopeless())
+            if (!fails || report_->is_hopeless())
                 continue;
             put_back_folder(ACCOUNT_FOLDER, from_.files);
             model_.emplace(read_account_files(), from_.flags);
@@ -109,11 +109,10 @@ void account_failer::spoil_disk(const start &from, guint64 amount) {
     }
 }
 
-void fail_accounts_on_bad_disk(proof_report *report, guint64 amount) {
+void fail_accounts_on_bad_disk(proof_report *report) {
     account_failer failer(report);
     for (const account_case &one : account_cases())
         if (*one.answer == '\0')  // what is refused writes nothing
             for (const guint32 flags : {guint32{0}, guint32{USERMGMT_OPEN_NO_CACHE}})
-                failer.spoil_disk({one.name, typical_accounts(), flags, one.what, -1, one.answer},
-                                  amount);
+                failer.spoil_disk({one.name, typical_accounts(), flags, one.what, -1, one.answer});
 }

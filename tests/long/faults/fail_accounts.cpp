@@ -103,7 +103,7 @@ void account_failer::strike(int index, const call_fault &fault) {
         fail(index, fault, wrong);
 }
 
-void account_failer::strike_all(const start &from, guint64 amount) {
+void account_failer::strike_all(const start &from) {
     from_ = from;
     if (from.failing_row >= 0)
         failing_path_ = core_file_table[from.failing_row].path + std::string(".tmp");
@@ -112,7 +112,7 @@ void account_failer::strike_all(const start &from, guint64 amount) {
     require_errors(*rehearsal_);
     for (int index = first_call_; index < rehearsal_->count; index++)
         for (const call_fault &fault : faults_of(rehearsal_->calls[index]))
-            if (report_->figure("faults") < amount && !report_->is_hopeless())
+            if (!report_->is_hopeless())
                 strike(index, fault);
 }
 
@@ -138,7 +138,7 @@ std::string account_failer::strike_open(int index, const call_fault &fault) {
     return go_on(slot.ctx.get(), result.succeeded ? expected.next_log : lines());
 }
 
-void account_failer::strike_all_of_open(const start &from, guint64 amount) {
+void account_failer::strike_all_of_open(const start &from) {
     from_ = from;
     put_back_folder(ACCOUNT_FOLDER, from_.files);
     (void)open_accounts(from.flags);  // grows what the C library reads lines into
@@ -148,7 +148,7 @@ void account_failer::strike_all_of_open(const start &from, guint64 amount) {
     require_errors(*rehearsal_);
     for (int index = 0; index < rehearsal_->count; index++) {
         for (const call_fault &fault : faults_of(rehearsal_->calls[index])) {
-            if (report_->figure("faults") >= amount || report_->is_hopeless())
+            if (report_->is_hopeless())
                 return;
             put_back_folder(ACCOUNT_FOLDER, from_.files);
             model_.emplace(read_account_files(), from_.flags);
@@ -164,15 +164,14 @@ void account_failer::strike_all_of_open(const start &from, guint64 amount) {
     }
 }
 
-void fail_every_account_call(proof_report *report, guint64 amount) {
+void fail_every_account_call(proof_report *report) {
     account_failer failer(report);
     for (const guint32 flags : {guint32{0}, guint32{USERMGMT_OPEN_NO_CACHE}})
-        failer.strike_all_of_open({"opening", typical_accounts(), flags}, amount);
+        failer.strike_all_of_open({"opening", typical_accounts(), flags});
     for (const account_case &one : account_cases()) {
-        failer.strike_all({one.name, typical_accounts(), 0, one.what, -1, one.answer}, amount);
+        failer.strike_all({one.name, typical_accounts(), 0, one.what, -1, one.answer});
         for (int row = 0; row < CORE_FILE_COUNT; row++)
             failer.strike_all({std::string(one.name) + ", reloaded after a failed write",
-                               typical_accounts(), USERMGMT_OPEN_NO_CACHE, one.what, row},
-                              amount);
+                               typical_accounts(), USERMGMT_OPEN_NO_CACHE, one.what, row});
     }
 }

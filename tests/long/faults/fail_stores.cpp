@@ -15,9 +15,9 @@ class store_failer {
   public:
     store_failer(proof_report *report, std::string folder)
         : report_(report), folder_(std::move(folder)) {}
-    void strike_all(const store_case &one, guint64 amount);
+    void strike_all(const store_case &one);
     // The disk goes bad at each call that writes, stays so for the next try, and is mended.
-    void spoil_disk(const store_case &one, guint64 amount);
+    void spoil_disk(const store_case &one);
 
   private:
     bool rehearse();
@@ -133,7 +133,7 @@ std::string store_failer::strike(int index, const call_fault &fault) {
                                                                     : wrong;
 }
 
-void store_failer::strike_all(const store_case &one, guint64 amount) {
+void store_failer::strike_all(const store_case &one) {
     one_ = one;
     if (!rehearse())
         return;
@@ -143,7 +143,7 @@ void store_failer::strike_all(const store_case &one, guint64 amount) {
                           ": nobody listed how a call fails: " + line_of(rehearsal_->calls[index]));
     for (int index = 0; index < rehearsal_->count; index++) {
         for (const call_fault &fault : faults_of(rehearsal_->calls[index])) {
-            if (report_->figure("faults") >= amount || report_->is_hopeless())
+            if (report_->is_hopeless())
                 return;
             const std::string wrong = strike(index, fault);
             report_->count("faults");
@@ -219,7 +219,7 @@ std::string store_failer::outlive_bad_disk(int index, int error) {
                : "on the mended disk it ends in another file";
 }
 
-void store_failer::spoil_disk(const store_case &one, guint64 amount) {
+void store_failer::spoil_disk(const store_case &one) {
     static constexpr int errors[] = {EIO, ENOSPC, EDQUOT, EROFS};
     one_ = one;
     if (!rehearse())
@@ -227,8 +227,7 @@ void store_failer::spoil_disk(const store_case &one, guint64 amount) {
     for (int index = 0; index < rehearsal_->count; index++) {
         const trapped_call &call = rehearsal_->calls[index];
         for (const int error : errors) {
-            if (!(call.writes || (error == EROFS && call.may_write)) ||
-                report_->figure("faults") >= amount || report_->is_hopeless())
+            if (!(call.writes || (error == EROFS && call.may_write)) || report_->is_hopeless())
                 continue;
             const std::string wrong = outlive_bad_disk(index, error);
             report_->count("faults");
@@ -241,11 +240,11 @@ void store_failer::spoil_disk(const store_case &one, guint64 amount) {
     }
 }
 
-void fail_every_store_call(proof_report *report, const std::string &folder, guint64 amount) {
+void fail_every_store_call(proof_report *report, const std::string &folder) {
     store_failer failer(report, folder);
     const std::vector<store_case> cases = store_cases(folder);
     for (const store_case &one : cases)
-        failer.spoil_disk(one, amount);
+        failer.spoil_disk(one);
     for (const store_case &one : cases)
-        failer.strike_all(one, amount);
+        failer.strike_all(one);
 }

@@ -7,4 +7,4 @@
 #include "tests/long/faults/proof.h"
 
 // Every call of every operation with every error, below a folder.
-void fail_every_store_call(proof_report *report, const std::string &folder, guint64 amount);
+void fail_every_store_call(proof_report *report, const std::string &folder);

@@ -14,9 +14,9 @@ int main(int count, char **words) {
         return PROOF_CANNOT_RUN;
 
     proof_report report("failing_calls");
-    fail_accounts_on_bad_disk(&report, options.amount);
-    fail_every_account_call(&report, options.amount);
-    fail_every_store_call(&report, place.folder(), options.amount);
+    fail_accounts_on_bad_disk(&report);
+    fail_every_account_call(&report);
+    fail_every_store_call(&report, place.folder());
     report.count("max_exhaustive_faults", report.figure("faults"));
     fail_random_account_calls(&report, options.amount, options.seed);
     if (const std::string call = unknown_call(); !call.empty())

@@ -4,7 +4,7 @@
 #include "tests/long/faults/proof.h"
 
 // Every point of every operation, from every start.
-void kill_every_account_operation(proof_report *report, guint64 amount);
+void kill_every_account_operation(proof_report *report);
 
 // Points by chance in operations by chance, until the report counts so many.
 void kill_random_account_operations(proof_report *report, guint64 amount, guint64 seed);

@@ -16,8 +16,8 @@ int main(int count, char **words) {
         return PROOF_CANNOT_RUN;
 
     proof_report report("kill_points");
-    kill_every_account_operation(&report, options.amount);
-    kill_every_store_operation(&report, place.folder(), options.amount);
+    kill_every_account_operation(&report);
+    kill_every_store_operation(&report, place.folder());
     report.count("max_exhaustive_points", report.figure("points"));
     kill_random_account_operations(&report, options.amount, options.seed);
     if (!outside_is_untouched())

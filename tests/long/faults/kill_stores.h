@@ -7,4 +7,4 @@
 #include "tests/long/faults/proof.h"
 
 // Every point of every operation, from every start, below a folder.
-void kill_every_store_operation(proof_report *report, const std::string &folder, guint64 amount);
+void kill_every_store_operation(proof_report *report, const std::string &folder);

@@ -27,7 +27,7 @@ static bool read_words(int count, char **words, proof_options *out_options) {
 bool read_proof_options(int count, char **words, proof_options *out_options) {
     if (read_words(count, words, out_options))
         return true;
-    (void)std::fprintf(stderr, "usage: %s --amount N --seed S --figures FILE\n", words[0]);
+    (void)std::fprintf(stderr, "usage: %s --amount N [--seed S] [--figures FILE]\n", words[0]);
     return false;
 }
 

@@ -14,7 +14,7 @@ struct proof_options {
     std::string figures;  // the file that they go to
 };
 
-// False, and the usage told, for any other line than --amount N --seed S --figures FILE.
+// False, and the usage told, for any other line than --amount N [--seed S] [--figures FILE].
 bool read_proof_options(int count, char **words, proof_options *out_options);
 
 // Counts, and collects what went wrong.
