@@ -6,6 +6,7 @@ import struct
 import subprocess
 import sys
 import time
+from collections.abc import Sequence
 from pathlib import Path
 
 # The temporary files of what is not everybody's to read.
@@ -43,28 +44,34 @@ class TemporaryWatch:
         canary.write_text("canary")
         assert self._line() == f"read {canary}"
         canary.unlink()
+        # Only what the service writes is to count.
+        assert self._process.stdin is not None
+        print("forget", file=self._process.stdin, flush=True)
+        assert self._line() == "forgot"
 
-    def require_nothing_read(self) -> None:
+    def require_nothing_read(self, written: Sequence[str] = WATCHED) -> None:
+        """Of the files, those written since must each have been tried."""
         assert self._process.poll() is None and self._process.stdin is not None
         self._process.stdin.close()
         tried = self._line()
         assert tried.startswith("tried "), f"somebody else {tried}"
-        assert int(tried.split()[1]) > 0
+        missed = set(written) - set(tried.split()[1:])
+        assert not missed, f"nobody tried to read {missed}"
 
     def close(self) -> None:
         self._process.kill()
         self._process.wait(5)
 
 
-def _try_to_read(path: str) -> None:
+def _try_to_read(path: str) -> bool:
     end = time.monotonic() + TRY_SECONDS
     while time.monotonic() < end:
         try:
             os.close(os.open(path, os.O_RDONLY))
         except OSError:
             continue
-        print(f"read {path}", flush=True)
-        return
+        return True
+    return False
 
 
 def watch() -> None:
@@ -74,11 +81,15 @@ def watch() -> None:
                for folder in sorted({os.path.dirname(path) for path in WATCHED})}
     assert -1 not in folders, "inotify"
     print("watching", flush=True)
-    tried = 0
+    tried: set[str] = set()
     while True:
         ready, _, _ = select.select([notices, sys.stdin], [], [])
         if notices not in ready:
-            break
+            if not sys.stdin.readline():
+                break
+            tried.clear()
+            print("forgot", flush=True)
+            continue
         data = os.read(notices, 1 << 16)
         while data:
             number, _, _, length = EVENT.unpack_from(data)
@@ -86,9 +97,10 @@ def watch() -> None:
             data = data[EVENT.size + length:]
             path = os.path.join(folders.get(number, "/"), name)
             if path in WATCHED:
-                tried += 1
-                _try_to_read(path)
-    print(f"tried {tried}", flush=True)
+                if _try_to_read(path):
+                    print(f"read {path}", flush=True)
+                tried.add(path)
+    print("tried", *sorted(tried), flush=True)
 
 
 if __name__ == "__main__":
