@@ -75,7 +75,8 @@ class Figures:
         return added_up(self._of(proof, passed=True))
 
     def done(self, proof: Proof) -> float:
-        return self.counts(proof).get(proof.unit, 0)
+        amounts = [start["counts"].get(proof.unit, 0) for start in self._of(proof, passed=True)]
+        return max(amounts, default=0) if proof.at_once else self.counts(proof).get(proof.unit, 0)
 
     def trees(self, proof: Proof) -> Counts:
         """How much of its unit the proof has done on each, in the order of the first start."""

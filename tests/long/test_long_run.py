@@ -6,6 +6,7 @@ import signal
 import subprocess
 import sys
 import time
+from dataclasses import replace
 from pathlib import Path
 from types import ModuleType
 
@@ -74,6 +75,19 @@ def test_a_proof_that_is_all_repetition_is_done_once(figures: Figures) -> None:
         assert figures.done(proof) == 368
 
 
+def test_of_what_shows_in_one_long_start_only_the_longest_counts(
+        runner: ModuleType, figures: Figures) -> None:
+    proof = replace(proof_of("", aim=10), at_once=True)
+    for seed, points in ((2, 9), (3, 8)):
+        figures.add(proof, 10, seed, Outcome(True, {"points": points}, "", 1), "a")
+    assert figures.done(proof) == 9
+    assert (proof.next_amount(9), proof.next_amount(10)) == (proof.step, proof.full) == (10, 100)
+    assert runner.seconds_of_next(proof, figures) == 1
+    figures.add(proof, 10, 4, Outcome(True, {"points": 10}, "", 1), "a")
+    assert runner.seconds_of_next(proof, figures) == 10
+    assert replace(proof, at_once=False).next_amount(10) == 10
+
+
 def test_a_failure_is_kept_and_named_and_counts_nothing(figures: Figures, tmp_path: Path) -> None:
     proof = proof_of("")
     figures.add(proof, 5, 2, passed(points=5), "a")
@@ -137,10 +151,12 @@ def test_nothing_is_begun_that_would_not_end_in_time(
     text = "time.sleep(0.05); count(points=told.amount, failures=0)"
     short, long = proof_of(text, name="short", aim=1000), proof_of(text, name="long", pace=0.5)
     started = time.monotonic()
-    runner.work([short, long], 0.05, figures)
+    assert runner.work([short, long], 0.05, figures)
     assert time.monotonic() - started < 30
     assert figures.done(long) == 0 and figures.done(short) > 0
     assert "long is left out: one start takes about 0.1 minutes" in capsys.readouterr().out
+    assert not runner.work([long], 0.05, figures)
+    assert "no proof was started" in capsys.readouterr().err
     runner.work([long], 0.1, figures)
     assert figures.done(long) >= 10
 
@@ -192,7 +208,7 @@ def test_a_proof_that_fails_always_is_left_alone_and_the_others_go_on(
     assert len(figures.failed()) == runner.MOST_FAILURES
     assert figures.done(bad) == 0
     assert f"bad failed {runner.MOST_FAILURES} times and is left alone" in capsys.readouterr().out
-    runner.work([bad, good], MINUTES, figures)
+    assert not runner.work([bad, good], MINUTES, figures)
     assert len(figures.failed()) == 3 * runner.MOST_FAILURES
     assert figures.done(good) == GOOD_STARTS * good.step
 
@@ -224,6 +240,20 @@ def sample_run(folder: Path, *words: str, text: str = "") -> subprocess.Popen[st
                "sys.exit(run.main())\n")
     return subprocess.Popen([sys.executable, "-B", "-c", program, *words], text=True,
                             stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+
+
+@pytest.mark.parametrize(("text", "minutes", "status"), [
+    ("time.sleep(0.3); count(points=told.amount, failures=0)", "0.02", 0),
+    ("sys.exit(1)", "0.02", 1),
+    ("count(points=told.amount, failures=0)", "0.00001", 1),
+])
+def test_the_exit_status_is_that_of_this_run_s_own_starts(
+        tmp_path: Path, figures: Figures, text: str, minutes: str, status: int) -> None:
+    figures.add(proof_of(""), 1, 2, Outcome(False, {}, "", 0.1), "a")
+    with sample_run(tmp_path, "--minutes", minutes, text=text) as run:
+        assert run.wait(60) == status
+    with sample_run(tmp_path, "--show") as run:
+        assert run.wait(60) == 0
 
 
 @pytest.mark.parametrize("number", [signal.SIGINT, signal.SIGTERM, signal.SIGHUP])

@@ -1,4 +1,6 @@
 """tests/long/test_runner.py: a proof's figures count, and cannot hide a failure; none runs on."""
+import shlex
+import subprocess
 import threading
 import time
 from pathlib import Path
@@ -46,6 +48,25 @@ def test_seconds_may_miss_a_little(counted: int, is_enough: bool) -> None:
     assert proofs.run(proof, 60, 1).passed == is_enough
 
 
+@pytest.mark.parametrize(("counted", "known", "is_enough"), [
+    (5, 5, True), (4, 5, False), (5, 9, False), (7, 9, True)])
+def test_what_there_is_less_of_than_the_amount_has_to_be_done_whole(
+        counted: int, known: int, is_enough: bool) -> None:
+    proof = proof_of(f"count(points={counted}, max_known_points={known}, failures=0)")
+    assert proofs.run(proof, 7, 3).passed == is_enough
+
+
+def test_what_a_proof_printed_ends_with_what_repeats_it(tmp_path: Path) -> None:
+    proof = proof_of("print('x' * 20_000)\n"
+                     f"pathlib.Path('{tmp_path / 'seed'}').write_text(f'{{told.seed}}')")
+    outcome = proofs.run(proof, 7, 3)
+    (tmp_path / "seed").unlink()
+    _, said, again = outcome.output[-8000:].rpartition("\nagain: ")
+    assert said and "--figures" not in shlex.split(again)[3:]
+    assert subprocess.run(shlex.split(again), stdout=subprocess.DEVNULL).returncode == 0
+    assert (tmp_path / "seed").read_text() == "3"
+
+
 def test_what_a_proof_printed_is_kept() -> None:
     outcome = proofs.run(proof_of("print('seen'); print('also', file=sys.stderr); sys.exit(3)"), 1, 1)
     assert "seen" in outcome.output and "also" in outcome.output
@@ -58,6 +79,16 @@ def test_every_row_names_a_program_of_the_tree_or_of_its_build() -> None:
         assert program.startswith("build") or (proofs.TREE / program).exists(), program
         assert bool(proof.step) == bool(proof.aim) and proof.aim <= proof.full, proof.name
         assert proof.gate > 0 or proof.aim > 0, proof.name
+
+
+def test_the_gate_does_no_less_of_any_proof_than_was_promised() -> None:
+    least = {"kill_points": 2_000, "daemon_kills": 200, "failing_calls": 5_000, "daemon_faults": 200,
+             "power_cuts": 3_000, "fuzzing": 10, "bus_fuzzing": 46_000, "authorization_matrix": 368,
+             "policy_matrix": 368, "races": 5_000, "soak": 60, "flood": 10, "flood_limited": 10,
+             "daemon_secrets": 400, "seeded_defects": 8}
+    gate = {proof.name: proof.gate for proof in proofs.of_gate()}
+    assert gate.keys() == least.keys()
+    assert [name for name in gate if gate[name] < least[name]] == []
 
 
 def test_every_row_is_in_the_gate_and_in_a_long_run_by_itself_or_by_its_family() -> None:

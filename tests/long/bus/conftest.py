@@ -2,6 +2,7 @@
 
 Each module is a proof of its own; tests/long/on_bus starts one.
 """
+import argparse
 import json
 import random
 from collections import Counter
@@ -18,9 +19,16 @@ pytest.register_assert_rewrite("authorization_table")
 FIGURES = pytest.StashKey[Counter]()
 
 
+def positive(text: str) -> int:
+    number = int(text)
+    if number <= 0:
+        raise argparse.ArgumentTypeError("must be above 0")
+    return number
+
+
 def pytest_addoption(parser: pytest.Parser) -> None:
     group = parser.getgroup("proof")
-    group.addoption("--amount", type=int, default=100, help="how much, in the proof's own unit")
+    group.addoption("--amount", type=positive, default=100, help="how much, in the proof's own unit")
     group.addoption("--seed", type=int, default=1, help="where everything random starts from")
     group.addoption("--figures", type=Path, help="the file that gets the counts, as JSON")
 

@@ -41,6 +41,8 @@ CALLS: dict[str, Call] = {
     **READS,
 }
 NEXT: Call = ("AddGroup", "later")
+# Of 2,705 that were counted: a rehearsal that sees fewer calls has missed some.
+LEAST_KNOWN = 2_500
 # Their failed write reloads the users alone. What they changed in the groups stays in memory, and
 # the next change of a group writes it.
 # A failed change of a user's fields alone reloads nothing: it stays in memory whole, and the next
@@ -200,7 +202,7 @@ class Faults:
 
 
 def chosen(faults: list[Fault], most: int, chance: random.Random) -> list[Fault]:
-    """Each call once with an error by chance, then the other errors."""
+    """Each call once with an error by chance, then the other errors, as far as there are."""
     chance.shuffle(faults)
     seen: set[tuple[str, str, int]] = set()
     ranks = {}
@@ -233,11 +235,9 @@ def test_fail_at_calls(killed: KilledService, amount: int, chance: random.Random
     faults = Faults(killed)
     all_faults = faults.all_faults()
     figures["max_known_faults"] = len(all_faults)
-    struck = chosen(all_faults, amount, chance)
-    # A run that wants more than there are goes round again.
-    while len(struck) < amount:
-        struck += chosen(all_faults, amount - len(struck), chance)
-    for fault in struck:
+    assert len(all_faults) >= LEAST_KNOWN
+    for fault in chosen(all_faults, amount, chance):
         figures["harmful_faults"] += faults.strike(fault)
         figures["faults"] += 1
+        figures["max_exhaustive_faults"] += 1
     assert 0 < figures["harmful_faults"] < figures["faults"]

@@ -17,7 +17,7 @@ from typing import Any, Callable, Iterator, TypeVar
 import pytest
 
 from harness import packaged, process
-from harness.account_model import digest_line
+from harness.account_rules import digest_line
 from harness.accounts import CLERK_UID, AccountFiles
 from harness.bus import Bus
 from harness.changing_accounts import Texts, stored_hash
