@@ -4,6 +4,7 @@
 // half understood grants what nobody wanted, or locks out whoever is to repair it.
 #include "platform/authz/policy/policy_file.h"
 
+#include <algorithm>
 #include <cstddef>
 #include <cstring>
 
@@ -104,14 +105,24 @@ static void role_free(void *data) {
     g_free(role);
 }
 
-static bool has_control_character(std::string_view line) {
+// Of a kind that shows nothing, or that shows what stands around it in another order or on another
+// line: to whoever reads the file it says something else than here, in a comment as well.
+static bool is_hidden(gunichar character) {
+    const GUnicodeType type = g_unichar_type(character);
+    return type == G_UNICODE_CONTROL || type == G_UNICODE_FORMAT ||
+           type == G_UNICODE_LINE_SEPARATOR || type == G_UNICODE_PARAGRAPH_SEPARATOR;
+}
+
+// 0 where there is none; itself no character of a line that is UTF-8.
+static gunichar find_hidden(std::string_view line) {
     const char *end = line.data() + line.size();
 
     for (const char *p = line.data(); p < end; p = g_utf8_find_next_char(p, nullptr)) {
-        if (g_unichar_iscntrl(g_utf8_get_char(p)))
-            return true;
+        const gunichar character = g_utf8_get_char(p);
+        if (is_hidden(character))
+            return character;
     }
-    return false;
+    return 0;
 }
 
 static bool end_role(const reading &state) {
@@ -200,8 +211,12 @@ static bool read_key(const reading &state, std::string_view line) {
 static bool read_line(reading *state, std::string_view line) {
     if (!g_utf8_validate(line.data(), static_cast<gssize>(line.size()), nullptr))
         return refuse(*state, state->line, "not UTF-8");
-    if (has_control_character(line))
-        return refuse(*state, state->line, "a control character");
+    const gunichar hidden = find_hidden(line);
+    if (hidden != 0)
+        return refuse(*state, state->line,
+                      g_unichar_iscntrl(hidden) ? "a control character, U+%04X"
+                                                : "a hidden character, U+%04X",
+                      hidden);
     if (line.find_first_not_of(' ') == std::string_view::npos || line.front() == '#')
         return true;
     return line.front() == '[' ? begin_role(state, line) : read_key(*state, line);
@@ -224,7 +239,13 @@ policy *policy_parse(std::string_view text, GError **error) {
             return nullptr;
         text.remove_prefix(length + 1);
     }
-    return end_role(state) ? g_steal_pointer(&rules) : nullptr;
+    // It grants nothing either way; but a file that lost its content must not pass for one that
+    // somebody meant.
+    if (state.role == nullptr)
+        (void)refuse(state, std::max(state.line, 1U), "no role in the file");
+    else if (end_role(state))
+        return g_steal_pointer(&rules);
+    return nullptr;
 }
 
 void policy_free(policy *rules) {

@@ -33,9 +33,11 @@ TEST(PolicyFile, RolesWithCommentsAndBlankLinesAreAPolicy) {
     EXPECT_EQ(parse("# \xc3\xa4 is UTF-8: [role a = b]\n" + ROLE), "ok");
 }
 
-TEST(PolicyFile, WithoutARoleItGrantsNothing) {
-    EXPECT_EQ(parse(""), "ok");
-    EXPECT_EQ(parse("# nobody\n"), "ok");
+TEST(PolicyFile, FileWithoutARoleIsRefused) {
+    EXPECT_EQ(parse(""), refusal("1: no role in the file"));
+    EXPECT_EQ(parse("\n"), refusal("1: no role in the file"));
+    EXPECT_EQ(parse("# nobody\n\n  \n"), refusal("3: no role in the file"));
+    EXPECT_EQ(parse("#[role a]\n#users=u\n#actions=x.y\n"), refusal("3: no role in the file"));
 }
 
 TEST(PolicyFile, UnknownSectionIsRefused) {
@@ -107,10 +109,68 @@ TEST(PolicyFile, OtherBytesThanTextAreRefused) {
         EXPECT_EQ(parse("#\n# " + bytes + "\n" + ROLE), refusal("2: not UTF-8"));
         EXPECT_EQ(parse("[role a]\nusers=" + bytes + "\n"), refusal("2: not UTF-8"));
     }
-    for (const std::string &bytes : {"\r"s, "\t"s, "\x1b"s, "\x7f"s, "\xc2\x85"s, "\x01"s}) {
-        EXPECT_EQ(parse("#\n# " + bytes + "\n" + ROLE), refusal("2: a control character"));
-        EXPECT_EQ(parse("[role a]" + bytes + "\n"), refusal("1: a control character"));
-    }
+}
+
+// In the characters of a text that is UTF-8.
+struct hidden_character {
+    const char *bytes;
+    const char *number;
+};
+
+static void expect_refused(const hidden_character &character, const std::string &kind) {
+    const std::string why = kind + ", U+" + character.number;
+    EXPECT_EQ(parse("#\n# a" + std::string(character.bytes) + "b\n" + ROLE), refusal("2: " + why));
+    EXPECT_EQ(parse("[role a]" + std::string(character.bytes) + "\n"), refusal("1: " + why));
+    EXPECT_EQ(parse(ROLE + character.bytes + "\n"), refusal("4: " + why));
+}
+
+TEST(PolicyFile, ControlCharacterIsRefused) {
+    for (const hidden_character &character : {
+             hidden_character{"\r",       "000D"},
+             {"\t",       "0009"},
+             {"\x1b",     "001B"},
+             {"\x7f",     "007F"},
+             {"\xc2\x85", "0085"},
+             {"\x01",     "0001"}
+    })
+        expect_refused(character, "a control character");
+}
+
+// Those that turn the direction of what is shown, those that show nothing, and ends of lines that
+// are none here.
+TEST(PolicyFile, HiddenCharacterIsRefused) {
+    for (const hidden_character &character : {
+             hidden_character{"\xe2\x80\xaa",     "202A" },
+             {"\xe2\x80\xab",     "202B" },
+             {"\xe2\x80\xac",     "202C" },
+             {"\xe2\x80\xad",     "202D" },
+             {"\xe2\x80\xae",     "202E" },
+             {"\xe2\x81\xa6",     "2066" },
+             {"\xe2\x81\xa7",     "2067" },
+             {"\xe2\x81\xa8",     "2068" },
+             {"\xe2\x81\xa9",     "2069" },
+             {"\xe2\x80\x8e",     "200E" },
+             {"\xe2\x80\x8f",     "200F" },
+             {"\xd8\x9c",         "061C" },
+             {"\xe2\x80\x8b",     "200B" },
+             {"\xe2\x80\x8c",     "200C" },
+             {"\xe2\x80\x8d",     "200D" },
+             {"\xe2\x81\xa0",     "2060" },
+             {"\xef\xbb\xbf",     "FEFF" },
+             {"\xc2\xad",         "00AD" },
+             {"\xf3\xa0\x81\x81", "E0041"},
+             {"\xe2\x80\xa8",     "2028" },
+             {"\xe2\x80\xa9",     "2029" }
+    })
+        expect_refused(character, "a hidden character");
+    EXPECT_EQ(parse("\xef\xbb\xbf" + ROLE), refusal("1: a hidden character, U+FEFF"));
+}
+
+TEST(PolicyFile, CommentMayBeInAnyLanguage) {
+    EXPECT_EQ(
+        parse("# \xd7\xa9\xd7\x9c\xd7\x95\xd7\x9d, e\xcc\x81, \xe2\x9a\xa0\xef\xb8\x8f\xc2\xa0!\n" +
+              ROLE),
+        "ok");
 }
 
 TEST(PolicyFile, TextThatWasCutOffIsRefused) {
@@ -230,7 +290,6 @@ TEST_F(PolicyDecision, UserIsNoGroupOfItsName) {
 }
 
 TEST_F(PolicyDecision, RootHasNothingThatNoRoleGrants) {
-    EXPECT_FALSE(allows("", 0, {0}, "x.y"));
     EXPECT_FALSE(allows("[role a]\nusers=clerk\nactions=x.*\n", 0, {0}, "x.y"));
     EXPECT_TRUE(allows("[role a]\nusers=root\nactions=x.*\n", 0, {0}, "x.y"));
 }
