@@ -35,6 +35,11 @@ def broken(why: str) -> BusError:
                                          f"{CHECK_USER}: {POLICY}{why}")
 
 
+def broken_folder(why: str) -> BusError:
+    return domain_error("authz", FAILED, "Authorization check failed: cannot check action "
+                                         f"{CHECK_USER}: {POLICY.parent}: {why}")
+
+
 def check_user(caller: Bus | User) -> BusError | bool:
     """The error, or what the service answered."""
     try:
@@ -46,9 +51,11 @@ def check_user(caller: Bus | User) -> BusError | bool:
 
 @pytest.fixture(autouse=True)
 def packaged_file() -> Iterator[str]:
-    """The text of the file, which is there again after the test."""
+    """The text of the file, which is there again after the test, as is its folder's owner."""
     packaged = POLICY.read_text()
     yield packaged
+    os.chown(POLICY.parent, 0, 0)
+    POLICY.parent.chmod(0o755)
     replace(POLICY, packaged, 0o644, 0)
 
 
@@ -205,6 +212,35 @@ def test_file_that_others_may_write_refuses_everybody(mode: int, real_service: S
     assert check_user(bus) == broken(": others than root may write it")
     POLICY.chmod(0o644)
     assert check_user(bus) is True
+
+
+@pytest.mark.parametrize("mode", [0o775, 0o757, 0o1777])
+def test_folder_that_others_may_write_refuses_everybody(mode: int, real_service: Service,
+                                                        bus: Bus, clerk: User) -> None:
+    folder = POLICY.parent
+    before = real_service.output()
+    expected = broken_folder("others than root may write it")
+    assert check_user(bus) is True
+
+    folder.chmod(mode)
+    assert check_user(bus) == expected
+    assert check_user(clerk) == expected
+    folder.chmod(0o755)
+    assert check_user(bus) is True
+    assert real_service.output() == before + [f"warning: {expected.text}"] * 2
+
+
+def test_folder_of_somebody_else_refuses_everybody(real_service: Service, bus: Bus) -> None:
+    os.chown(POLICY.parent, CLERK_UID, 0)
+    assert check_user(bus) == broken_folder("does not belong to root")
+    os.chown(POLICY.parent, 0, 0)
+    assert check_user(bus) is True
+
+
+@pytest.mark.parametrize("text", ["", "# [role root]\n"])
+def test_file_without_a_role_refuses_everybody(text: str, real_service: Service, bus: Bus) -> None:
+    replace(POLICY, text, 0o644, 0)
+    assert check_user(bus) == broken(":1: no role in the file")
 
 
 def test_file_of_somebody_else_refuses_everybody(real_service: Service, bus: Bus) -> None:

@@ -126,7 +126,15 @@ TEST_F(PolicyCheck, BrokenFileIsNamedWithLineAndReason) {
                   return check_own("x.y");
               }),
               broken(":2: unknown key 'user'"));
-    EXPECT_EQ(in_etc([] { return check_own("x.y"); }), broken(": No such file or directory"));
+    EXPECT_EQ(
+        in_etc([] { return check_own("x.y"); }),
+        "0 authz 2 cannot check action x.y: " + fs::path(AUTHZ_POLICY_FILE).parent_path().string() +
+            ": No such file or directory");
+    EXPECT_EQ(in_etc([] {
+                  fs::create_directories(fs::path(AUTHZ_POLICY_FILE).parent_path());
+                  return check_own("x.y");
+              }),
+              broken(": No such file or directory"));
     EXPECT_EQ(in_etc([] {
                   grant("users=me");
                   (void)chmod(AUTHZ_POLICY_FILE, 0666);
