@@ -1,6 +1,7 @@
 // tests/unit/methods/tool_runner_test.cpp: running a tool.
 #include "methods/tool_runner.h"
 
+#include <cerrno>
 #include <csignal>
 #include <cstdlib>
 #include <string>
@@ -161,4 +162,51 @@ TEST_F(ToolRunner, EnvironmentIsInheritedAndDescriptorsAreNot) {
     EXPECT_EQ(output(), "inherited\n/dev/null\n");
     (void)unsetenv("TOOL_RUNNER_TEST");
     (void)close(open_here);
+}
+
+static bool has_close_range = true;
+
+// The linker sends the runner's calls here (--wrap).
+int real_close_range(unsigned first, unsigned last, int flags) asm("__real_close_range");
+int wrap_close_range(unsigned first, unsigned last, int flags) asm("__wrap_close_range");
+int wrap_close_range(unsigned first, unsigned last, int flags) {
+    if (has_close_range)
+        return real_close_range(first, last, flags);
+    errno = ENOSYS;
+    return -1;
+}
+
+// As on a kernel that does not know the call.
+class ToolRunnerOnAnOldKernel : public ToolRunner {
+  protected:
+    ToolRunnerOnAnOldKernel() { has_close_range = false; }
+    ~ToolRunnerOnAnOldKernel() override { has_close_range = true; }
+};
+
+TEST_F(ToolRunnerOnAnOldKernel, ItForksAndTheOutcomeIsTheSame) {
+    const int open_here = open("/dev/null", O_RDONLY);
+    ASSERT_GT(open_here, 2);
+    ASSERT_EQ(pthread_atfork(count_fork, nullptr, nullptr), 0);
+    forks = 0;
+
+    EXPECT_TRUE(run_script_without_fork(
+        "printf '<%s>' \"$@\"; cd /proc/$$/fd; "
+        "for fd in *; do [ $fd -gt 2 ] && [ -e $fd ] && readlink $fd; done; exit 3"));
+    EXPECT_GT(forks, 0);
+    EXPECT_EQ(output() + error_output(), "<a b><$(c)><>none");
+    EXPECT_EQ(result_.wait_status, 3 << 8);
+    EXPECT_EQ(fcntl(open_here, F_GETFD), 0);
+    (void)close(open_here);
+}
+
+TEST_F(ToolRunnerOnAnOldKernel, TheErrorIsTheSame) {
+    const char *const argv[] = {"/nonexistent/tool", nullptr};
+    g_autoptr(GError) forked = nullptr;
+    EXPECT_FALSE(run_tool(argv, tool_capture::OUTPUT, &result_, &forked));
+    g_autoptr(GError) other = nullptr;
+    EXPECT_FALSE(run_tool_without_fork(argv, &result_, &other));
+
+    EXPECT_TRUE(g_error_matches(other, forked->domain, forked->code));
+    EXPECT_STREQ(other->message, forked->message);
+    EXPECT_EQ(result_.wait_status, -1);
 }

@@ -1,6 +1,5 @@
 // tests/unit/platform/policy_store_test.cpp: which files are read, and that a change counts at
 // once.
-
 #include <string>
 #include <vector>
 
