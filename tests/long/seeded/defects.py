@@ -48,6 +48,9 @@ DEFECTS = (
     Defect("forgotten-authorization.patch",
            Start("authorization_matrix", 46, ("-k", "test_refused")),
            r"^E +assert None == BusError\(.*reboot is refused to uid "),
+    # Of an array; of a single string another row tells.
+    Defect("missing-utf8-check-of-lists.patch", Start("fuzzing", 5, ("--target", "replies")),
+           r"^ +g_variant_new_string: assertion 'g_utf8_validate "),
     # The content is the same, and so is its time.
     Defect("unheeded-policy-mode.patch",
            Start("policy_matrix", 46, ("-k", "test_other_mode")),
