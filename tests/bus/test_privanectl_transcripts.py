@@ -41,6 +41,7 @@ def test_there_are_some() -> None:
     assert len(transcripts("docs/privanectl.md")) == 4
 
 
+@pytest.mark.real_authz
 @pytest.mark.parametrize("command, shown", [*transcripts("README.md"),
                                             *transcripts("docs/privanectl.md")])
 def test_transcript(command: str, shown: str, accounts: AccountFiles, start: StartService,

@@ -117,6 +117,7 @@ def test_foreground_never_asks_to_detach(start: StartService, authz: FakeAuthz, 
     assert not record.exists()
 
 
+@pytest.mark.real_authz
 def test_no_thread_starts_before_the_detaching_with_the_real_authorization(
         start: StartService, bus: Bus, tmp_path: Path) -> None:
     trace = Trace(tmp_path / "trace", "clone,clone3,fork,vfork")

@@ -168,6 +168,7 @@ def test_failing_database_ends_the_daemon_after_it_detached(
     assert bus.owner() is None
 
 
+@pytest.mark.real_authz
 def test_failing_database_releases_the_real_authorization(start: StartService, bus: Bus,
                                                           accounts: AccountFiles) -> None:
     accounts.write_exactly(STANDARD_PASSWD, STANDARD_SHADOW, None)

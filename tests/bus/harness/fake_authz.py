@@ -8,6 +8,8 @@ from harness.sandbox import fake_library
 DOMAIN = "fake-authz"
 CODE = 42
 
+VARIABLE = "FAKE_AUTHZ_DIRECTORY"
+
 
 @dataclass(frozen=True)
 class Check:
@@ -38,7 +40,7 @@ class FakeAuthz:
 
     def environment(self) -> dict[str, str]:
         return {"LD_LIBRARY_PATH": str(self._path.parent),
-                "FAKE_AUTHZ_DIRECTORY": str(self._directory)}
+                VARIABLE: str(self._directory)}
 
     @property
     def path(self) -> Path:

@@ -6,7 +6,7 @@ import tempfile
 from pathlib import Path
 from typing import Mapping, Sequence
 
-from harness import process
+from harness import fake_authz, process
 from harness.bus import Bus
 from harness.deadline import wait_for
 from harness.sandbox import BINARY, SYSTEM_BUS, require_sandbox
@@ -33,11 +33,16 @@ class Service:
     """One run of the binary. The process that is started either is the service ("-n" alone) or
     leaves it behind, in which case it comes to us as the adopter of orphans."""
 
+    # How many of all had one of our own libauthz.
+    with_own_authz = 0
+
     def __init__(self, arguments: Sequence[str] = ("-n",),
                  environment: Mapping[str, str] | None = None, wrapper: Sequence[str] = (),
                  ignored: Sequence[signal.Signals] = (),
                  stop_seconds: float | None = None) -> None:
         require_sandbox()
+        if fake_authz.VARIABLE not in (environment or {}):
+            Service.with_own_authz += 1
         self.in_foreground = list(arguments) == ["-n"]
         self._stop_seconds = stop_seconds or (TRACED_STOP_SECONDS if wrapper else STOP_SECONDS)
         self.status: int | None = None
