@@ -137,9 +137,14 @@ class User:
     def _exchange(self, request: dict[str, Any]) -> Any:
         assert self._process.stdin is not None and self._process.stdout is not None
         print(json.dumps(request), file=self._process.stdin, flush=True)
-        answer = json.loads(self._process.stdout.readline())
+        line = self._process.stdout.readline()
+        if not line:
+            raise RuntimeError(f"the process of the user {self.uid} has ended")
+        answer = json.loads(line)
         if "error" in answer:
             raise BusError(*answer["error"])
+        if "local" in answer:
+            raise GLib.Error(*answer["local"])
         return answer["reply"]
 
     def call(self, member: str, signature: str = "", *arguments: Any,

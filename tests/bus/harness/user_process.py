@@ -1,10 +1,14 @@
 """tests/bus/harness/user_process.py: makes bus calls as the user that it runs as.
 
-Reads a request a line from standard input and answers each with a line; see bus.User.
+Reads a request a line from standard input and answers each with a line; see bus.User. A call that
+fails here, such as one that is not answered in time, is an answer too: the process is shared, and
+goes on with the next request.
 """
 import json
 import sys
 from typing import Any
+
+from gi.repository import GLib
 
 from harness.bus import Bus, BusError
 
@@ -28,6 +32,8 @@ def main() -> None:
             result = {"reply": answer(bus, json.loads(line))}
         except BusError as error:
             result = {"error": [error.name, error.text]}
+        except GLib.Error as error:
+            result = {"local": [error.message, error.domain, error.code]}
         print(json.dumps(result), flush=True)
 
 
