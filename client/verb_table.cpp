@@ -47,12 +47,25 @@ static constexpr argument fixed(const char *value) {
     return {source::FIXED, value, value_kind::TEXT, nullptr, OPTION_NONE};
 }
 
+static constexpr argument NO_ARGUMENT = {};
 static constexpr argument USER_NAME = word("NAME", value_kind::USER);
 static constexpr argument GROUP_NAME = word("NAME", value_kind::GROUP);
 static constexpr argument UNIT_NAME = word("UNIT", value_kind::UNIT);
 static constexpr argument ASKED_TWICE = password(source::NEW_PASSWORD);
 static constexpr argument ASKED_ONCE = password(source::CURRENT_PASSWORD);
 static constexpr argument ASKED_ON_DEMAND = password(source::OPTIONAL_PASSWORD);
+
+// Without arguments and an answer.
+static constexpr command plain(const char *noun, const char *verb, const char *method,
+                               const char *help) {
+    return {.noun = noun, .verb = verb, .method = method, .help = help};
+}
+
+// What scripts of ours call, the help says nothing of.
+static constexpr command untold(const char *noun, argument taken,
+                                bool (*run)(const session &run, GError **error)) {
+    return {.noun = noun, .arguments = {taken}, .run = run};
+}
 
 static constexpr command COMMANDS[] = {
     {.noun = "user",
@@ -124,7 +137,7 @@ static constexpr command COMMANDS[] = {
     {.noun = "user",
      .verb = "announce",
      .method = "RtspreadConfig",
-     .help = "Let all clients read the accounts again"},
+     .help = "Let all clients read the accounts again"                           },
 
     {.noun = "group",
      .verb = "list",
@@ -209,12 +222,12 @@ static constexpr command COMMANDS[] = {
     {.noun = "default-target",
      .method = "SetDefaultTarget",
      .arguments = {word("TARGET", value_kind::TARGET)},
-     .help = "Choose what the device boots into"},
-    {.noun = "ntp",                                                                  .verb = "start",                                                                                       .method = "StartNtp",                                                                                                                                                                                                     .help = "Start the time service"},
-    {.noun = "ntp",                                                                              .verb = "stop",                                                                                          .method = "StopNtp",                                                                                                                                                                                                                .help = "Stop the time service"},
-    {.noun = "ntp",                                                      .verb = "restart",                                                                                   .method = "RestartNtp",                                                                                                                                                                                                      .help = "Restart the time service"},
-    {.noun = "lensd",                                                                 .verb = "start",                                                                                  .method = "StartLensd",                                                                                                                                                                                                           .help = "Start the lens service"},
-    {.noun = "lensd",                                     .verb = "stop",                                                               .method = "StopLensd",                                                                                                                                                                   .help = "Stop the lens service"},
+     .help = "Choose what the device boots into"                       },
+    plain("ntp", "start", "StartNtp", "Start the time service"),
+    plain("ntp", "stop", "StopNtp", "Stop the time service"),
+    plain("ntp", "restart", "RestartNtp", "Restart the time service"),
+    plain("lensd", "start", "StartLensd", "Start the lens service"),
+    plain("lensd", "stop", "StopLensd", "Stop the lens service"),
 
     {.noun = "clock",
      .verb = "set",
@@ -232,7 +245,7 @@ static constexpr command COMMANDS[] = {
     {.noun = "clock",
      .verb = "synced",
      .method = "NotifyTimeSync",
-     .help = "Tell that the clock was set right"},
+     .help = "Tell that the clock was set right"                                           },
 
     {.noun = "net",
      .verb = "info",
@@ -282,11 +295,11 @@ static constexpr command COMMANDS[] = {
     {.noun = "serial",
      .method = "ReadSerno",
      .answer = shape::LINE,
-     .help = "Print the serial number"},
+     .help = "Print the serial number"                        },
     {.noun = "slabinfo",
      .method = "GetSlabinfo",
      .answer = shape::TEXT,
-     .help = "Print the kernel's slab statistics"},
+     .help = "Print the kernel's slab statistics"                 },
     {.noun = "log",
      .method = "ReadLogFile",
      .arguments = {word("PATH", value_kind::FILE_PATH)},
@@ -302,7 +315,7 @@ static constexpr command COMMANDS[] = {
     {.noun = "reboot",
      .method = "Reboot",
      .help = "Restart the device, or perform the reset that is armed",
-     .judge = judge_reboot},
+     .judge = judge_reboot              },
     {.noun = "reset",
      .verb = "arm",
      .method = "UpdateReleaseFile",
@@ -312,14 +325,14 @@ static constexpr command COMMANDS[] = {
 
     {.noun = "monitor",
      .help = "Print each announcement of changed accounts as it comes",
-     .run = run_monitor},
+     .run = run_monitor                                                              },
     {.noun = "explain",
      .arguments = {word("METHOD", value_kind::METHOD),
                    optional_word("UNIT|TARGET|MODE", value_kind::UNIT)},
      .help = "Tell a method's action, whether you may, and what would grant it",
-     .run = run_explain},
-    {.noun = "verbs", .run = run_verbs                                                                                  },
-    {.noun = "complete",                                                                .arguments = {words("WORD")},                                                                                           .run = run_complete                                                                                                                                                                                                           },
+     .run = run_explain                             },
+    untold("verbs", NO_ARGUMENT, run_verbs),
+    untold("complete", words("WORD"), run_complete),
 };
 
 std::span<const command> commands() {
