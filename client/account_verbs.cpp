@@ -20,14 +20,18 @@ static GVariant *digest_arguments(const char *action, const char *list) {
     return g_variant_new("(^as)", arguments);
 }
 
+// A line is a login, and the first ":" in it ends the name.
+static bool check_login_name(const char *name, GError **error) {
+    if (*name != '\0' && std::strpbrk(name, ":\n") == nullptr)
+        return true;
+    return fail_usage(error, "no web login can be named '%s'", name);
+}
+
 GVariant *build_digest_set(const command_line &line, GError **error) {
     const char *name = word_at(line, 2);
 
-    // The first ":" of the entry ends the name.
-    if (std::strpbrk(name, ":\n") != nullptr) {
-        (void)fail_usage(error, "no web login can be named '%s'", name);
+    if (!check_login_name(name, error))
         return nullptr;
-    }
     g_auto(wiped_string) password = arguments_password(line, true, error);
     if (password == nullptr)
         return nullptr;
@@ -72,10 +76,13 @@ GVariant *build_digest_import(const command_line &, GError **error) {
     return list != nullptr ? digest_arguments("set", list) : nullptr;
 }
 
-GVariant *build_digest_delete(const command_line &line, GError **) {
+GVariant *build_digest_delete(const command_line &line, GError **error) {
     g_autoptr(GString) list = g_string_new(nullptr);
 
-    for (guint i = 2; i < line.words->len; i++)
+    for (guint i = 2; i < line.words->len; i++) {
+        if (!check_login_name(word_at(line, i), error))
+            return nullptr;
         g_string_append_printf(list, "%s\n", word_at(line, i));
+    }
     return digest_arguments("delete", list->str);
 }

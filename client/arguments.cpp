@@ -3,25 +3,16 @@
 
 #include <cstring>
 
-#include "client/client_error.h"
 #include "client/password_prompt.h"
-
-char *unit_without_suffix(const char *word, const char *suffix) {
-    if (g_str_has_suffix(word, suffix))
-        return g_strndup(word, std::strlen(word) - std::strlen(suffix));
-    return g_strdup(word);
-}
+#include "client/unit_name.h"
 
 char *arguments_password(const command_line &line, bool is_new, GError **error) {
-    const char *given = line.options[OPTION_PASSWORD_FD];
     gint64 fd = 0;
 
-    if (given == nullptr)
+    if (line.options[OPTION_PASSWORD_FD] == nullptr)
         return password_ask(is_new ? "New password: " : "Password: ", is_new, error);
-    if (!parse_number(given, 0, G_MAXINT, &fd)) {
-        (void)fail_usage(error, "--password-fd takes the number of a descriptor");
+    if (!option_number(line, OPTION_PASSWORD_FD, &fd, error))
         return nullptr;
-    }
     return password_read(static_cast<int>(fd), is_new, error);
 }
 
@@ -34,28 +25,18 @@ static char *password_of(source from, const command_line &line, GError **error) 
     return arguments_password(line, from != source::CURRENT_PASSWORD, error);
 }
 
-// A choice that is none of the words is a usage error, as is none where there must be one.
-static const char *choice_of(const argument &taken, const char *word, GError **error) {
-    if (taken.kind != value_kind::CHOICE || is_choice(taken.choices, word))
-        return word;
-    g_autofree char *listed = g_strdup(taken.choices);
-    (void)fail_usage(error, "%s is one of %s, not '%s'", taken.name, g_strdelimit(listed, " ", '|'),
-                     word);
-    return nullptr;
-}
-
 static char *first_choice(const argument &taken) {
     return g_strndup(taken.choices, std::strcspn(taken.choices, " "));
 }
 
-static char *text_of_word(const argument &taken, const char *word, GError **error) {
+static char *text_of_word(const argument &taken, const char *word) {
     if (word == nullptr)
         return first_choice(taken);
     if (taken.kind == value_kind::UNIT)
         return unit_without_suffix(word, ".service");
     if (taken.kind == value_kind::TARGET)
         return unit_without_suffix(word, ".target");
-    return g_strdup(choice_of(taken, word, error));
+    return g_strdup(word);
 }
 
 // Where words are taken, next counts them.
@@ -73,7 +54,7 @@ static char *text_of(const argument &taken, const command_line &line, guint *nex
         case source::CURRENT_PASSWORD:
             return password_of(taken.from, line, error);
         default:
-            return text_of_word(taken, word_at(line, (*next)++), error);
+            return text_of_word(taken, word_at(line, (*next)++));
     }
 }
 
@@ -95,20 +76,10 @@ static GStrv split_names(const char *text) {
     return g_strv_builder_end(names);
 }
 
-static GVariant *value_of(const char *signature, const argument &taken, const char *text,
-                          GError **error) {
-    gint64 number = 0;
-
+static GVariant *value_of(const char *signature, const argument &taken, const char *text) {
     if (std::strcmp(signature, "as") == 0) {
         g_auto(GStrv) names = split_names(text);
         return g_variant_new_strv(names, -1);
-    }
-    if (std::strcmp(signature, "i") == 0) {
-        if (parse_number(text, G_MININT32, G_MAXINT32, &number))
-            return g_variant_new_int32(static_cast<gint32>(number));
-        (void)fail_usage(error, "--%s takes a number, not '%s'", option_of(taken.option).name,
-                         text);
-        return nullptr;
     }
     // A method that takes several names in one string has them joined by ":".
     if (taken.option != OPTION_NONE && option_of(taken.option).kind == value_kind::GROUPS) {
@@ -133,11 +104,17 @@ GVariant *arguments_build(const command &row, const command_line &line, GError *
             g_variant_builder_add(&built, "b", is_chosen(taken, line, next));
             continue;
         }
+        if (std::strcmp(signature, "i") == 0) {
+            gint64 number = 0;
+            if (!option_number(line, taken.option, &number, error))
+                return nullptr;
+            g_variant_builder_add(&built, "i", static_cast<gint32>(number));
+            continue;
+        }
         g_auto(wiped_string) text = text_of(taken, line, &next, error);
-        GVariant *value = text != nullptr ? value_of(signature, taken, text, error) : nullptr;
-        if (value == nullptr)
+        if (text == nullptr)
             return nullptr;
-        g_variant_builder_add_value(&built, value);
+        g_variant_builder_add_value(&built, value_of(signature, taken, text));
     }
     return g_variant_builder_end(&built);
 }

@@ -12,6 +12,3 @@ GVariant *arguments_build(const command &row, const command_line &line, GError *
 // The password that a command needs, asked for or read from --password-fd; null with an error. The
 // message that carries it is GDBus's and cannot be wiped.
 char *arguments_password(const command_line &line, bool is_new, GError **error);
-
-// The name of a unit as the service takes it, without ".service" or ".target".
-char *unit_without_suffix(const char *word, const char *suffix);

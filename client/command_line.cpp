@@ -27,21 +27,9 @@ static void list_long_options(option *out_options) {
 }
 
 static bool parse_json_mode(const char *text, json_mode *out_mode, GError **error) {
-    static constexpr struct {
-        const char *name;
-        json_mode mode;
-    } MODES[] = {
-        {"short",  json_mode::SHORT },
-        {"pretty", json_mode::PRETTY},
-        {"off",    json_mode::OFF   },
-    };
-
-    for (const auto &row : MODES)
-        if (std::strcmp(text, row.name) == 0) {
-            *out_mode = row.mode;
-            return true;
-        }
-    return fail_usage(error, "--json takes short, pretty or off, not '%s'", text);
+    if (json_mode_find(text, out_mode))
+        return true;
+    return fail_usage(error, "--json takes %s, not '%s'", JSON_MODE_WORDS, text);
 }
 
 static bool parse_timeout(const char *text, int *out_ms, GError **error) {
@@ -159,6 +147,15 @@ void command_line_clear(command_line *line) {
 
 const char *word_at(const command_line &line, guint index) {
     return index < line.words->len ? static_cast<const char *>(line.words->pdata[index]) : nullptr;
+}
+
+bool option_number(const command_line &line, option_id id, gint64 *out_number, GError **error) {
+    const char *text = line.options[id];
+    const gint64 lowest = id == OPTION_PASSWORD_FD ? 0 : G_MININT32;
+
+    if (parse_number(text, lowest, G_MAXINT32, out_number))
+        return true;
+    return fail_usage(error, "--%s takes a number, not '%s'", option_of(id).name, text);
 }
 
 bool parse_number(const char *text, gint64 lowest, gint64 highest, gint64 *out_number) {

@@ -4,8 +4,7 @@
 #include <glib.h>
 
 #include "client/options.h"
-
-enum class json_mode { OFF, SHORT, PRETTY };
+#include "output/json_mode.h"
 
 // All texts are argv's own.
 struct command_line {
@@ -25,6 +24,9 @@ G_DEFINE_AUTO_CLEANUP_CLEAR_FUNC(command_line, command_line_clear)
 
 // Null where there are not so many.
 const char *word_at(const command_line &line, guint index);
+
+// The value of an option that is given and takes a number; false with a usage error.
+bool option_number(const command_line &line, option_id id, gint64 *out_number, GError **error);
 
 bool parse_number(const char *text, gint64 lowest, gint64 highest, gint64 *out_number);
 

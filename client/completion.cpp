@@ -39,8 +39,9 @@ static void add_values(const unfinished &line, value_kind kind, const char *choi
                        const char *prefix, const char *typed) {
     g_auto(GStrv) values = completion_values(*line.run, kind, choices);
 
-    // The shell completes paths itself.
-    if (kind == value_kind::FILE_PATH)
+    // The shell completes paths itself. The service's folder is not that of the shell: what does
+    // not begin at the root is another file there.
+    if (kind == value_kind::FILE_PATH && (*typed == '\0' || *typed == '/'))
         add_candidate(line, prefix, ":files", "");
     for (char **value = values; *value != nullptr; value++)
         add_candidate(line, prefix, *value, typed);

@@ -4,7 +4,7 @@
 #include "client/session.h"
 
 // As command::run: prints a candidate a line for the last of the words behind "complete --", or
-// ":files" where it is a path.
+// ":files" where it is a path, of which nothing or its root is typed.
 bool run_complete(const session &run, GError **error);
 
 // The candidates that do not depend on the machine are tested by themselves.

@@ -1,19 +1,14 @@
 // client/completion_values.cpp: what this machine has of users, groups, units and the like.
 #include "client/completion_values.h"
 
-#include <cstring>
-
 #include <grp.h>
 #include <pwd.h>
 
-#include "client/arguments.h"
+#include "client/unit_name.h"
 #include "privane_system_binding.h"
 
 // Nobody waits longer for a completion.
 static constexpr int PATIENCE_MS = 1000;
-
-// Those that the service acts on.
-static constexpr const char *UNIT_CHARACTERS = "abcdefghijklmnopqrstuvwxyz0123456789-@";
 
 // The account files are read, not the service asked: a completion is no call that one must be
 // allowed, or that should stand in a log.
@@ -59,7 +54,7 @@ static void add_units(const session &run, const char *suffix, GStrvBuilder *valu
     while (g_variant_iter_next(rows, "(&s&s)", &path, nullptr)) {
         g_autofree char *file = g_path_get_basename(path);
         g_autofree char *unit = unit_without_suffix(file, suffix);
-        if (std::strspn(unit, UNIT_CHARACTERS) == std::strlen(unit))
+        if (is_unit_name(unit))
             g_strv_builder_add(values, unit);
     }
 }
@@ -116,6 +111,7 @@ char **completion_values(const session &run, value_kind kind, const char *choice
             break;
         case value_kind::FILE_PATH:
         case value_kind::TEXT:
+        case value_kind::NUMBER:
             break;
     }
     return g_strv_builder_end(values);

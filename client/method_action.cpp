@@ -4,13 +4,10 @@
 #include <algorithm>
 #include <cstring>
 
-#include "client/arguments.h"
 #include "client/client_error.h"
+#include "client/unit_name.h"
 
 static constexpr const char *PREFIX = "com.zintor.privane-system.";
-
-static constexpr gsize LONGEST_UNIT = 64;
-static constexpr const char *UNIT_CHARACTERS = "abcdefghijklmnopqrstuvwxyz0123456789-@";
 
 // What an action depends on.
 enum class detail_kind { SERVICE, TARGET, MODE };
@@ -42,12 +39,6 @@ static const special_method *find_special(const char *method) {
         if (std::strcmp(row.method, method) == 0)
             return &row;
     return nullptr;
-}
-
-// The service acts on no other units.
-static bool is_unit_name(const char *unit) {
-    return std::strlen(unit) <= LONGEST_UNIT &&
-           std::strspn(unit, UNIT_CHARACTERS) == std::strlen(unit);
 }
 
 // All instances of a template have one action.

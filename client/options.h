@@ -7,6 +7,7 @@
 // goes to the service.
 enum class value_kind {
     TEXT,
+    NUMBER,
     USER,
     GROUP,
     GROUPS,     // names joined by ","

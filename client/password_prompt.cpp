@@ -76,14 +76,19 @@ static char *copy_password(const char *line, bool is_new, GError **error) {
     return g_strdup(line);
 }
 
-char *password_read(int fd, bool is_new, GError **error) {
+// Null with an error, or without one where a signal has ended it; mask as for read_line.
+static char *read_password(int fd, const sigset_t *mask, bool is_new, GError **error) {
     char line[LONGEST_LINE] = {};
     char *password = nullptr;
 
-    if (read_line(fd, nullptr, line, sizeof line, error) == line_end::FOUND)
+    if (read_line(fd, mask, line, sizeof line, error) == line_end::FOUND)
         password = copy_password(line, is_new, error);
     explicit_bzero(line, sizeof line);
     return password;
+}
+
+char *password_read(int fd, bool is_new, GError **error) {
+    return read_password(fd, nullptr, is_new, error);
 }
 
 // The terminal without echo, and the signals that would leave it so held back; the old state of
@@ -137,17 +142,11 @@ class silent_terminal {
 // Null with an error, or without one where a signal has ended it.
 static char *ask_line(int fd, const silent_terminal &terminal, const char *prompt, bool is_new,
                       GError **error) {
-    char line[LONGEST_LINE] = {};
-    char *password = nullptr;
-
     if (write(fd, prompt, std::strlen(prompt)) != static_cast<ssize_t>(std::strlen(prompt))) {
         (void)fail_failed(error, "Cannot ask for the password: %s", g_strerror(errno));
         return nullptr;
     }
-    if (read_line(fd, terminal.old_mask(), line, sizeof line, error) == line_end::FOUND)
-        password = copy_password(line, is_new, error);
-    explicit_bzero(line, sizeof line);
-    return password;
+    return read_password(fd, terminal.old_mask(), is_new, error);
 }
 
 static char *ask_in_silence(int fd, const char *prompt, bool is_new, GError **error) {

@@ -11,7 +11,8 @@ _privanectl() {
     if [[ ${COMPREPLY[*]} == *:files ]]; then
         before=${COMPREPLY[0]%:files}
         compopt -o filenames 2>/dev/null
-        mapfile -t COMPREPLY < <(compgen -f -- "${current#"$before"}")
+        current=${current#"$before"}
+        mapfile -t COMPREPLY < <(compgen -f -- "${current:-/}")
         return
     fi
     [[ ${COMPREPLY[*]} != *= ]] || compopt -o nospace 2>/dev/null

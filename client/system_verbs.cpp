@@ -46,6 +46,18 @@ static bool parse_date(const char *text, gint64 *out_seconds, gint64 *out_micros
     return *out_seconds >= G_MININT32 && *out_seconds <= G_MAXINT32;
 }
 
+// A time below 0 counts its microseconds upwards, as the kernel wants them: -5.5 is -6 and half a
+// million.
+static bool parse_epoch(const char *text, gint64 *out_seconds, gint64 *out_microseconds) {
+    if (!parse_seconds(text, out_seconds, out_microseconds))
+        return false;
+    if (*text == '-' && *out_microseconds != 0) {
+        *out_seconds -= 1;
+        *out_microseconds = MICROSECONDS - *out_microseconds;
+    }
+    return *out_seconds >= G_MININT32;
+}
+
 static GVariant *time_arguments(gint64 seconds, gint64 microseconds) {
     return g_variant_new("(ii)", static_cast<gint32>(seconds), static_cast<gint32>(microseconds));
 }
@@ -54,7 +66,7 @@ GVariant *build_clock_set(const command_line &line, GError **error) {
     const char *text = word_at(line, 2);
     gint64 seconds = 0;
     gint64 microseconds = 0;
-    const bool is_time = *text == '@' ? parse_seconds(text + 1, &seconds, &microseconds)
+    const bool is_time = *text == '@' ? parse_epoch(text + 1, &seconds, &microseconds)
                                       : parse_date(text, &seconds, &microseconds);
 
     if (is_time)

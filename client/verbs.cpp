@@ -149,6 +149,40 @@ static bool check_options(const command &row, const command_line &line, GError *
     return true;
 }
 
+// Words are counted before.
+static bool check_choices(const command &row, const command_line &line, GError **error) {
+    guint index = name_length(row);
+
+    for (const argument &taken : arguments_of(row)) {
+        if (taken.from != source::WORD && taken.from != source::OPTIONAL_WORD)
+            continue;
+        const char *word = word_at(line, index++);
+        if (taken.kind != value_kind::CHOICE || word == nullptr || is_choice(taken.choices, word))
+            continue;
+        g_autofree char *listed = g_strdup(taken.choices);
+        return fail_usage(error, "%s is one of %s, not '%s'", taken.name,
+                          g_strdelimit(listed, " ", '|'), word);
+    }
+    return true;
+}
+
+static bool check_option_values(const command_line &line, GError **error) {
+    gint64 number = 0;
+
+    for (const command_option &option : command_options()) {
+        const char *value = line.options[option.id];
+        if (value == nullptr)
+            continue;
+        if (option.kind == value_kind::NUMBER && !option_number(line, option.id, &number, error))
+            return false;
+        // Nothing at all is no secondary group; see check_change.
+        if (option.kind == value_kind::GROUPS && *value != '\0' &&
+            value[std::strspn(value, ",")] == '\0')
+            return fail_usage(error, "--%s=%s names no group", option.name, value);
+    }
+    return true;
+}
+
 bool command_check(const command &row, const command_line &line, GError **error) {
     guint least = 0;
     guint most = 0;
@@ -160,6 +194,8 @@ bool command_check(const command &row, const command_line &line, GError **error)
         g_autofree char *usage = command_usage(row);
         return fail_usage(error, "usage: privanectl %s", usage);
     }
+    if (!check_choices(row, line, error) || !check_option_values(line, error))
+        return false;
     const bool has_chosen = row.needs_change && line.words->len > least;
     if (has_chosen && !check_chosen(row, line, least, error))
         return false;

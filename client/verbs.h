@@ -79,7 +79,8 @@ bool noun_is_known(const char *noun);
 // The number of words that name a command.
 guint name_length(const command &row);
 
-// Whether the options and the number of words are the command's; false with a usage error.
+// Whether the options and words are the command's, as far as the client can tell; false with a
+// usage error. Afterwards a password may be asked for: nobody types one in vain.
 bool command_check(const command &row, const command_line &line, GError **error);
 
 bool takes_option(const command &row, option_id id);

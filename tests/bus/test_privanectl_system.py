@@ -3,6 +3,8 @@ from pathlib import Path
 
 import pytest
 
+from harness import process
+from harness.bus import Bus, BusError
 from harness.device import (ETHTOOL, LLDPCLI, NETSTAT, PINSRV, SMARTCTL, SYSFLASH, TIME_SYNC_HOOK,
                             Device)
 from harness.ethernet import AUTONEGOTIATION, FULL, HALF, Ethernet
@@ -177,6 +179,7 @@ def test_pinsrv(system: Stage, device: Device) -> None:
     assert run.status == DONE
     label, pid = run.output.split(": ")
     assert (label, int(pid) > 0) == ("PID", True)
+    assert process.wait_for_child(int(pid), 5) == 0
     system.use_real_pidof()
     assert system.calls() == [(PINSRV, "-d", "x y")]
     assert set(privanectl("pinsrv", "-j").json) == {"pid"}
@@ -200,3 +203,24 @@ def test_reboot_and_reset(system: Stage, device: Device) -> None:
     assert privanectl("reboot") == failed("The tool that reboots failed with status 3")
     device.tools[SYSFLASH].remove()
     assert privanectl("reboot") == failed("The tool that reboots could not be started")
+
+
+def test_client_knows_which_units_the_service_takes(system: Stage, bus: Bus) -> None:
+    """Each has a list of its own."""
+    units = [*(f"a{chr(byte)}b" for byte in range(1, 128)), "a" * 64, "a" * 65, "\u00e4"]
+
+    def is_taken_by_service(unit: str) -> bool:
+        try:
+            bus.call("StopService", "s", unit)
+        except BusError as error:
+            assert error.text.startswith("Invalid unit "), error
+            return False
+        return True
+
+    def is_taken_by_client(unit: str) -> bool:
+        refused = "privanectl: the service acts on no unit of the name "
+        return not privanectl("explain", "StopService", unit).errors.startswith(refused)
+
+    taken = {unit for unit in units if is_taken_by_service(unit)}
+    assert {"azb", "a-b", "a@b", "a" * 64} < taken
+    assert {unit for unit in units if is_taken_by_client(unit)} == taken

@@ -225,8 +225,12 @@ printf '%s\\n' "${{COMPREPLY[@]}}"
     ("privanectl explain StartN", ["StartNtp"]),
     ("privanectl explain GetActiveNetworkInfo ", ["all", "tcp-udp"]),
     ("privanectl explain GetUser ", []),
-    ("privanectl log ap", ["apache-file"]),
-    ("privanectl user add x --shell=ap", ["apache-file"]),
+    ("privanectl log /etc/apache2/ap", ["/etc/apache2/apache-file"]),
+    ("privanectl user add x --shell=/etc/apache2/ap", ["/etc/apache2/apache-file"]),
+    # The service would look for it in its own folder, which is the root.
+    ("privanectl log ap", []),
+    ("privanectl log ./ap", []),
+    ("privanectl user add x --shell=ap", []),
     ("privanectl verb", []),
     ("privanectl nothing ", []),
 ])
@@ -234,6 +238,11 @@ def test_completion(line: str, offered: list[str], changing_accounts: object) ->
     Path("/etc/apache2/apache-file").touch()
 
     assert complete(line) == offered
+
+
+def test_completion_of_a_path_begins_at_the_root() -> None:
+    assert {"/etc", "/usr"} <= set(complete("privanectl log "))
+    assert all(path.startswith("/") for path in complete("privanectl user add x --shell="))
 
 
 def test_completion_offers_every_method() -> None:
@@ -268,10 +277,13 @@ def test_completion_of_units() -> None:
     ("--json=sh\t", "--json=short"),
     ("user add x --pa\t3", "user add x --password-fd=3"),
     ("--address=unix:path=/x us\t", "--address=unix:path=/x user"),
+    ("log /etc/apache2/ap\t", "log /etc/apache2/apache-file"),
+    ("user add x --shell=/etc/apache2/ap\t", "user add x --shell=/etc/apache2/apache-file"),
 ])
 def test_completion_in_an_interactive_shell(typed: str, line: str,
                                             changing_accounts: object) -> None:
     """The shell splits words and puts in what it is offered by its own rules."""
+    Path("/etc/apache2/apache-file").touch()
     shell = Terminal("--norc", "-i", program=("/bin/bash",), environment={"PS1": "ready> "})
     try:
         shell.await_text("ready> ")

@@ -64,6 +64,17 @@ TEST(ClockSet, TakesSecondsAndDates) {
               "'2038-01-19 03:14:08Z' is no time; write \"2026-01-31 23:59:59\" or @SECONDS");
 }
 
+// The kernel takes no microseconds below 0.
+TEST(ClockSet, CountsMicrosecondsUpwardsBeforeTheEpoch) {
+    EXPECT_EQ(built(build_clock_set, {"clock", "set", "@-5.5"}), "(-6, 500000)");
+    EXPECT_EQ(built(build_clock_set, {"clock", "set", "@-0.000001"}), "(-1, 999999)");
+    EXPECT_EQ(built(build_clock_set, {"clock", "set", "@-5"}), "(-5, 0)");
+    EXPECT_EQ(built(build_clock_set, {"clock", "set", "@-2147483647.5"}), "(-2147483648, 500000)");
+    EXPECT_EQ(built(build_clock_set, {"clock", "set", "@-2147483648"}), "(-2147483648, 0)");
+    EXPECT_EQ(built(build_clock_set, {"clock", "set", "@-2147483648.5"}),
+              "'@-2147483648.5' is no time; write \"2026-01-31 23:59:59\" or @SECONDS");
+}
+
 TEST(Pinsrv, HasItsOwnNameInFront) {
     EXPECT_EQ(built(build_pinsrv, {"pinsrv"}), "(['pinsrv'],)");
     EXPECT_EQ(built(build_pinsrv, {"pinsrv", "-d", ""}), "(['pinsrv', '-d', ''],)");
@@ -78,6 +89,13 @@ TEST(Reset, HasTheWordOfItsKind) {
 TEST(DigestDelete, HasALineForEachName) {
     EXPECT_EQ(built(build_digest_delete, {"digest", "delete", "a", "b c"}),
               "(['delete', 'a\\nb c\\n'],)");
+}
+
+// Another login than the one that is named could go with it.
+TEST(DigestDelete, TakesNoNameThatIsMoreThanOne) {
+    for (const char *name : {"a:PRIVANE", "a\nb", ":", ""})
+        EXPECT_EQ(built(build_digest_delete, {"digest", "delete", "c", name}),
+                  std::string("no web login can be named '") + name + "'");
 }
 
 std::string verdict(bool (*judge)(GVariant *, GError **), int result) {
