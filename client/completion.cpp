@@ -9,7 +9,6 @@
 
 // A command line that is not finished: its last word is what is completed.
 struct unfinished {
-    const session *run;
     GPtrArray *words;          // const char *: what is no option, the last word left out
     const char *last;          // borrowed
     const char *pending;       // the option whose value the last word is, or null
@@ -37,7 +36,7 @@ static void add_candidate(const unfinished &line, const char *prefix, const char
 // prefix: what stands in front of the typed part in the last word.
 static void add_values(const unfinished &line, value_kind kind, const char *choices,
                        const char *prefix, const char *typed) {
-    g_auto(GStrv) values = completion_values(*line.run, kind, choices);
+    g_auto(GStrv) values = completion_values(kind, choices);
 
     // The shell completes paths itself. The service's folder is not that of the shell: what does
     // not begin at the root is another file there.
@@ -156,10 +155,10 @@ static void complete(const unfinished &line) {
     }
 }
 
-char **completion_candidates(const session &run, const char *const *words) {
+char **completion_candidates(const char *const *words) {
     g_autoptr(GPtrArray) plain = g_ptr_array_new();
     g_autoptr(GStrvBuilder) candidates = g_strv_builder_new();
-    unfinished line = {&run, plain, "", nullptr, candidates};
+    unfinished line = {plain, "", nullptr, candidates};
 
     for (const char *const *word = words; *word != nullptr; word++) {
         if (word[1] == nullptr) {
@@ -182,7 +181,7 @@ bool run_complete(const session &run, GError **error) {
 
     for (guint i = 1; i < given->len; i++)
         words[i - 1] = word_at(*run.line, i);
-    g_auto(GStrv) candidates = completion_candidates(run, words);
+    g_auto(GStrv) candidates = completion_candidates(words);
     for (guint i = 0; candidates[i] != nullptr; i++)
         if (!g_strv_contains(candidates + i + 1, candidates[i]))
             g_string_append_printf(text, "%s\n", candidates[i]);

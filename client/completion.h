@@ -8,4 +8,4 @@
 bool run_complete(const session &run, GError **error);
 
 // The candidates that do not depend on the machine are tested by themselves.
-char **completion_candidates(const session &run, const char *const *words);
+char **completion_candidates(const char *const *words);

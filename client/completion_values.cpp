@@ -4,6 +4,7 @@
 #include <grp.h>
 #include <pwd.h>
 
+#include "client/session.h"
 #include "client/unit_name.h"
 #include "privane_system_binding.h"
 
@@ -33,8 +34,8 @@ static void add_methods(GStrvBuilder *values) {
         g_strv_builder_add(values, (*method)->name);
 }
 
-static void add_units(const session &run, const char *suffix, GStrvBuilder *values) {
-    g_autoptr(GDBusConnection) bus = session_connect(run, nullptr);
+static void add_units(const char *suffix, GStrvBuilder *values) {
+    g_autoptr(GDBusConnection) bus = session_connect(nullptr);
     g_autofree char *pattern = g_strconcat("*", suffix, nullptr);
     const char *const patterns[] = {pattern, nullptr};
     const char *const states[] = {nullptr};
@@ -78,7 +79,7 @@ static void add_choices(const char *choices, GStrvBuilder *values) {
     g_strv_builder_addv(values, const_cast<const char **>(words));
 }
 
-char **completion_values(const session &run, value_kind kind, const char *choices) {
+char **completion_values(value_kind kind, const char *choices) {
     static constexpr const char *DISKS[] = {"sd", nullptr};
     static constexpr const char *INTERFACES[] = {"eth", "br", "wlan", nullptr};
     g_autoptr(GStrvBuilder) values = g_strv_builder_new();
@@ -92,10 +93,10 @@ char **completion_values(const session &run, value_kind kind, const char *choice
             add_groups(values);
             break;
         case value_kind::UNIT:
-            add_units(run, ".service", values);
+            add_units(".service", values);
             break;
         case value_kind::TARGET:
-            add_units(run, ".target", values);
+            add_units(".target", values);
             break;
         case value_kind::METHOD:
             add_methods(values);

@@ -52,6 +52,7 @@ static bool run_command_line(const command_line &line, bool on_terminal, GError 
     if (asked == nullptr || !command_check(*asked, line, error))
         return false;
     const session run = {&line, asked, on_terminal, in_color};
+    session_choose_bus(run);
     return asked->run != nullptr ? asked->run(run, error) : call_service(run, error);
 }
 

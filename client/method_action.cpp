@@ -106,6 +106,13 @@ bool method_action_amounts_to_root(const method_action &action) {
                                [name](const char *other) { return std::strcmp(name, other) == 0; });
 }
 
+// The role bears a name that no other has: a repeated one would make the file no policy.
+char *method_action_example_role(const method_action &action, const char *user) {
+    const char *name = action.id + std::strlen(PREFIX);
+
+    return g_strdup_printf("[role %s-%s]\nusers=%s\nactions=%s\n", name, user, user, action.id);
+}
+
 char *method_action_example_rule(const method_action &action, const char *user) {
     GString *rule = g_string_new("polkit.addRule(function (action, subject) {\n");
 

@@ -22,3 +22,6 @@ bool method_action_amounts_to_root(const method_action &action);
 
 // A rule of polkit's that grants the action, for the administrator to adapt.
 char *method_action_example_rule(const method_action &action, const char *user);
+
+// A role of the policy file's that grants it, likewise.
+char *method_action_example_role(const method_action &action, const char *user);

@@ -63,7 +63,7 @@ static bool await_subscription(GDBusConnection *bus, GError **error) {
 }
 
 bool run_monitor(const session &run, GError **error) {
-    g_autoptr(GDBusConnection) bus = session_connect(run, error);
+    g_autoptr(GDBusConnection) bus = session_connect(error);
     const int flags =
         G_DBUS_PROXY_FLAGS_DO_NOT_LOAD_PROPERTIES | G_DBUS_PROXY_FLAGS_DO_NOT_AUTO_START;
 

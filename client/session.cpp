@@ -8,18 +8,17 @@
 #include "client/client_error.h"
 #include "privane_system_binding.h"
 
-GDBusConnection *session_connect(const session &run, GError **error) {
+void session_choose_bus(const session &run) {
     const char *address = run.line->options[OPTION_ADDRESS];
-    GDBusConnection *bus = nullptr;
 
-    if (address == nullptr) {
-        bus = g_bus_get_sync(G_BUS_TYPE_SYSTEM, nullptr, error);
-    } else {
-        const int flags = G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_CLIENT |
-                          G_DBUS_CONNECTION_FLAGS_MESSAGE_BUS_CONNECTION;
-        bus = g_dbus_connection_new_for_address_sync(
-            address, static_cast<GDBusConnectionFlags>(flags), nullptr, nullptr, error);
-    }
+    // The authorization library has to meet the same bus.
+    if (address != nullptr)
+        (void)g_setenv("DBUS_SYSTEM_BUS_ADDRESS", address, TRUE);  // No thread reads it meanwhile.
+}
+
+GDBusConnection *session_connect(GError **error) {
+    GDBusConnection *bus = g_bus_get_sync(G_BUS_TYPE_SYSTEM, nullptr, error);
+
     if (bus == nullptr) {
         g_prefix_error(error, "Cannot reach the bus: ");
         return nullptr;
@@ -32,7 +31,7 @@ GDBusConnection *session_connect(const session &run, GError **error) {
 GVariant *session_call(const session &run, const GDBusMethodInfo *method, GVariant *arguments,
                        GError **error) {
     g_autoptr(GVariant) owned = g_variant_ref_sink(arguments);
-    g_autoptr(GDBusConnection) bus = session_connect(run, error);
+    g_autoptr(GDBusConnection) bus = session_connect(error);
     const int flags = G_DBUS_PROXY_FLAGS_DO_NOT_LOAD_PROPERTIES |
                       G_DBUS_PROXY_FLAGS_DO_NOT_CONNECT_SIGNALS |
                       G_DBUS_PROXY_FLAGS_DO_NOT_AUTO_START_AT_CONSTRUCTION;

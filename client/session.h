@@ -17,8 +17,11 @@ struct session {
     bool in_color;
 };
 
-// The bus of the command line, or null with an error.
-GDBusConnection *session_connect(const session &run, GError **error);
+// Makes the bus of the command line the system bus of this process; before anything connects.
+void session_choose_bus(const session &run);
+
+// The system bus, or null with an error.
+GDBusConnection *session_connect(GError **error);
 
 // What the service answers to a method, or null with an error.
 GVariant *session_call(const session &run, const GDBusMethodInfo *method, GVariant *arguments,

@@ -1,4 +1,5 @@
 """tests/bus/test_privanectl_explain.py: what the client tells of actions, with the real polkit."""
+from pathlib import Path
 from typing import Any
 
 import pytest
@@ -10,6 +11,7 @@ from harness.polkit import ExampleRules, declared, local_rules
 from harness.privanectl import (DONE, Run, as_user, failed, on_terminal, privanectl, wrong_usage)
 from harness.sandbox import start_bus
 from harness.deadline import wait_for
+from harness.fake_authz import FakeAuthz
 from harness.service import Service
 
 pytestmark = pytest.mark.polkit
@@ -46,20 +48,16 @@ polkit.addRule(function (action, subject) {
 
 def test_text_for_root(real_service: Service) -> None:
     assert privanectl("explain", "RestartService", "sshd.service") == Run(DONE, """\
-    Method: RestartService
-    Action: com.zintor.privane-system.restartservice.sshd
-   Allowed: yes (polkit allows it)
-Granted by: this rule in /etc/polkit-1/rules.d
-
-polkit.addRule(function (action, subject) {
-    if (action.id === "com.zintor.privane-system.restartservice" &&
-        action.lookup("unit") === "sshd" &&
-        subject.user === "root") {
-        return polkit.Result.YES;
-    }
-    return polkit.Result.NOT_HANDLED;
-});
+ Method: RestartService
+ Action: com.zintor.privane-system.restartservice.sshd
+Allowed: yes (polkit allows it)
 """, "")
+
+
+def test_who_is_allowed_already_is_told_of_no_rule(real_service: Service) -> None:
+    told = explain("CheckUser")
+
+    assert (told["allowed"], told["grant"], told["rule"]) == ("yes", None, None)
 
 
 @pytest.mark.parametrize("method", METHODS, ids=lambda method: method.member)
@@ -133,8 +131,59 @@ def test_bus_is_the_first_door(real_service: Service) -> None:
     told = explain("GetUser", wrapper=as_user(STRANGER_UID))
 
     assert (told["allowed"], told["reason"]) == ("no", CLOSED)
+    assert told["grant"] == (
+        "membership in the group privane, and this rule in /etc/polkit-1/rules.d")
+    assert 'subject.user === "stranger"' in told["rule"]
     assert privanectl("user", "list", wrapper=as_user(STRANGER_UID)).errors.endswith(
         "(org.freedesktop.DBus.Error.AccessDenied)\n")
+
+
+def test_rule_alone_does_not_open_the_bus(real_service: Service, bus: Bus, clerk: User) -> None:
+    as_stranger = as_user(STRANGER_UID)
+    with local_rules(bus, clerk, explain("GetUser", wrapper=as_stranger)["rule"]):
+        told = explain("GetUser", wrapper=as_stranger)
+    assert (told["allowed"], told["reason"]) == ("no", CLOSED)
+    assert (told["grant"], told["rule"]) == ("membership in the group privane", None)
+
+
+def test_service_that_does_not_run(bus: Bus, clerk: User) -> None:
+    """The bus refuses strangers only what it could pass on; and nobody starts the service by asking."""
+    untold = "polkit allows it; whether the bus does is told only while the service runs"
+    as_stranger = as_user(STRANGER_UID)
+    refused = explain("GetUser", wrapper=as_stranger)
+    with local_rules(bus, clerk, refused["rule"]):
+        for wrapper in (as_stranger, None):
+            told = explain("GetUser", wrapper=wrapper)
+            assert (told["allowed"], told["reason"], told["rule"]) == ("unknown", untold, None)
+    assert (refused["allowed"], refused["reason"]) == ("no", REFUSED)
+
+
+def test_library_of_the_devices_maker(real_service: Service, authz: FakeAuthz) -> None:
+    def ask() -> tuple[str, ...]:
+        told = privanectl("explain", "GetUser", "--json=short",
+                          environment=authz.environment()).json
+        return told["allowed"], told["reason"], told["grant"], told["rule"]
+    unknown = "what the device's own authorization library asks"
+
+    authz.allow()
+    assert ask() == ("yes", "the authorization library allows it", None, None)
+    authz.refuse("not for you")
+    assert ask() == ("no", "the authorization library refuses it: not for you", unknown, None)
+    authz.refuse_silently()
+    assert ask() == ("no", "the authorization library refuses it: libauthz.so.1 gives no reason",
+                     unknown, None)
+    assert privanectl("explain", "GetUser", environment=authz.environment()).output.endswith(
+        f"Granted by: {unknown}\n")
+
+
+def test_library_that_is_not_there(real_service: Service, tmp_path: Path) -> None:
+    (tmp_path / "libauthz.so.1").write_text("no library")
+    told = privanectl("explain", "GetUser", "--json=short",
+                      environment={"LD_LIBRARY_PATH": str(tmp_path)}).json
+
+    assert told["allowed"] == "unknown"
+    assert told["reason"].startswith(
+        f"the authorization library does not tell: {tmp_path}/libauthz.so.1: ")
 
 
 def test_bus_without_polkit(tmp_path: Any) -> None:
@@ -144,8 +193,8 @@ def test_bus_without_polkit(tmp_path: Any) -> None:
         wait_for("the other bus", (tmp_path / "bus").exists)
         told = explain("GetUser", f"--address={address}")
         assert told["allowed"] == "unknown"
-        assert told["reason"].startswith(
-            "polkit does not tell: The name org.freedesktop.PolicyKit1 was not provided")
+        assert told["reason"].startswith("the authorization library does not tell: "
+                                         "org.freedesktop.PolicyKit1 is neither running")
     finally:
         other.terminate()
         other.wait(5)
@@ -165,6 +214,9 @@ def test_answer_is_coloured_nowhere(real_service: Service) -> None:
      "the action of GetActiveNetworkInfo depends on its mode: all or tcp-udp"),
     (("GetUser", "alice"), "the action of GetUser depends on nothing"),
     (("StartService", "Sshd"), "the service acts on no unit of the name 'Sshd'"),
+    (("StartService", ""), "the service acts on no unit of the name ''"),
+    (("StopService", ".service"), "the service acts on no unit of the name ''"),
+    (("SetDefaultTarget", ""), "the service acts on no unit of the name ''"),
     (("StartService", "a" * 65), f"the service acts on no unit of the name '{'a' * 65}'"),
 ])
 def test_wrong_questions(words: tuple[str, ...], text: str) -> None:

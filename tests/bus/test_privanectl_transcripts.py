@@ -7,11 +7,12 @@ import pytest
 from harness.accounts import AccountFiles
 from harness.bus import Bus
 from harness.passwords import NEW, OLD_HASH
-from harness.privanectl import Terminal
+from harness.privanectl import PROGRAM, Terminal, as_user
 from harness.service_fixtures import StartService
 
 TREE = Path(__file__).parents[2]
-PROMPT = "    $ privanectl "
+PROMPT = "privanectl "
+ROOT, ALICE = "    $ ", "    alice$ "
 
 PASSWD = """\
 root:x:0:0:root:/root:/bin/sh
@@ -22,12 +23,12 @@ GROUP = "root:x:0:\nusers:x:100:alice\noperator:x:102:alice\n"
 
 
 def transcripts(document: str) -> list[tuple[str, str]]:
-    """The commands that are shown, each with what it prints."""
+    """The commands that are shown, with the prompt, each with what it prints."""
     found: list[tuple[str, list[str]]] = []
     is_shown = False
     for line in (TREE / document).read_text().splitlines():
-        if line.startswith(PROMPT):
-            found.append((line.removeprefix(PROMPT), []))
+        if line.startswith((ROOT + PROMPT, ALICE + PROMPT)):
+            found.append((line, []))
             is_shown = True
         elif is_shown and (line.startswith("    ") or not line):
             found[-1][1].append(line[4:])
@@ -45,11 +46,14 @@ def test_there_are_some() -> None:
 @pytest.mark.parametrize("command, shown", [*transcripts("README.md"),
                                             *transcripts("docs/privanectl.md")])
 def test_transcript(command: str, shown: str, accounts: AccountFiles, start: StartService,
-                    bus: Bus) -> None:
+                    bus: Bus, privane_gid: int) -> None:
     accounts.write_exactly(PASSWD, SHADOW, GROUP)
     service = start()
     service.wait_registered(bus)
-    terminal = Terminal(*shlex.split(command), environment={"TERM": "dumb"})
+    who, words = command.split(PROMPT, 1)
+    wrapper = as_user(1000, (privane_gid,)) if who == ALICE else []
+    terminal = Terminal(*shlex.split(words), environment={"TERM": "dumb"},
+                        program=(*wrapper, PROGRAM))
     try:
         seen = ""
         for question in ("New password: ", "Again: "):
