@@ -2,7 +2,8 @@
 #pragma once
 
 #include "check/findings.h"
+#include "check/mount_points.h"
 #include "usermgmt/core_file.h"
 
 // Looks at the file itself, not at its lines. False where it cannot be read or is not there.
-bool review_file(const core_file &file, findings *out);
+bool review_file(const core_file &file, const mount_points &mounts, findings *out);

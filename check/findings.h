@@ -1,9 +1,9 @@
 // check/findings.h: what the checker has found.
 #pragma once
 
-#include <span>
-#include <string>
-#include <vector>
+#include <glib.h>
+
+#include "usermgmt/account_records.h"
 
 // In the order of their gravity.
 enum class gravity {
@@ -16,25 +16,32 @@ enum class gravity {
 struct finding {
     gravity weight;
     const char *kind;  // a word of its own for each kind, which scripts may rely on
-    std::string file;
-    unsigned line;        // from 1; 0: of the whole file
-    std::string account;  // a user or a group; may be empty
-    std::string text;     // a sentence for people; holds no password and no hash
+    const char *file;  // of core_file_table
+    unsigned line;     // from 1; 0: of the whole file
+    char *account;     // a user or a group, or null
+    char *text;        // a sentence for people; holds no password and no hash
 };
 
 class findings {
   public:
-    void add(finding found) { all_.push_back(std::move(found)); }
+    findings();
+    ~findings();
+    findings(const findings &) = delete;
+    findings &operator=(const findings &) = delete;
 
-    std::span<const finding> all() const { return all_; }
+    // Takes the text.
+    void add(gravity weight, const char *kind, const char *file, unsigned line, const char *account,
+             char *text);
+
+    records<const finding> all() const { return records<const finding>(all_); }
     bool has(gravity weight) const;
-    // Forgets all that weigh less.
-    void keep(gravity least);
-    // By file, in the given order, then by line.
-    void sort(std::span<const std::string> files);
+    // Forgets all others.
+    void keep(gravity weight);
+    // By file, in the order of core_file_table, then by line; else as they were found.
+    void sort();
 
   private:
-    std::vector<finding> all_;
+    GPtrArray *all_;
 };
 
 // "notice", "change", "loss", "unusable".

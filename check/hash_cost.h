@@ -5,10 +5,21 @@
 
 #include <glib.h>
 
-// The rounds that a hash of crypt(5) asks for, of the methods that name them: "$5$" and "$6$" with
-// "rounds=", and the power of two of "$2b$" and its kin. 0 for all others.
-guint64 hash_rounds(std::string_view hash);
+enum class hash_work {
+    NOTHING,  // no hash at all, or one of a method whose cost is fixed and small
+    ROUNDS,   // of the method's own kind
+    MEMORY,   // bytes that are filled and read
+    UNKNOWN,  // a method that crypt(5) does not name
+};
 
-// More than a login check may cost: a million rounds of SHA-512 take a slow camera some seconds, in
-// which the service serves nobody else.
-bool is_absurd_hash(std::string_view hash);
+struct hash_cost {
+    hash_work work;
+    guint64 amount;  // as the hash asks for; 0 where it is not well formed and nobody can log in
+    bool is_absurd;  // more than a login check may cost, in which the service serves nobody else
+};
+
+hash_cost find_hash_cost(std::string_view hash);
+
+// What is amiss with it, as a sentence that quotes no more than the name of its method; null where
+// nothing is.
+char *describe_hash(std::string_view hash);

@@ -1,8 +1,7 @@
 // check/main.cpp: privane-check, which tells what a write of the service would do to the account
 // files. It only reads.
+#include <cerrno>
 #include <cstdio>
-#include <string>
-#include <vector>
 
 #include <glib.h>
 #include <sys/prctl.h>
@@ -21,6 +20,7 @@ enum exit_status {
     WRONG_CALL = 2,
     ACCOUNTS_ARE_LOST = 3,
     CANNOT_WORK = 4,
+    CANNOT_TELL = 5,
 };
 
 static int status_of(const findings &found) {
@@ -32,19 +32,20 @@ static int status_of(const findings &found) {
 }
 
 static void add_error(findings *out, const char *file, const GError *error) {
-    out->add({gravity::UNUSABLE, "unreadable", file, 0, "", error->message});
+    out->add(gravity::UNUSABLE, "unreadable", file, 0, nullptr, g_strdup(error->message));
 }
 
-static bool read_files(account_files *files, findings *out) {
+static bool read_files(account_file (&files)[CORE_FILE_COUNT], const mount_points &mounts,
+                       findings *out) {
     bool are_read = true;
     for (int row = 0; row < CORE_FILE_COUNT; row++) {
         const core_file &file = core_file_table[row];
-        if (!review_file(file, out)) {
+        if (!review_file(file, mounts, out)) {
             are_read = are_read && row == CORE_FILE_ROW_SHADOW && !out->has(gravity::UNUSABLE);
             continue;
         }
         g_autoptr(GError) error = nullptr;
-        if (!read_account_lines(file, &files->lines[row], &files->has_last_end[row], &error)) {
+        if (!read_account_file(file, &files[row], &error)) {
             add_error(out, file.path, error);
             are_read = false;
         }
@@ -52,10 +53,7 @@ static bool read_files(account_files *files, findings *out) {
     return are_read;
 }
 
-static void check_accounts(findings *out) {
-    account_files files;
-    if (!read_files(&files, out))
-        return;
+static void review_read_files(const account_file (&files)[CORE_FILE_COUNT], findings *out) {
     // What loading logs is told here.
     (void)setlogmask(LOG_MASK(LOG_EMERG));
     g_autoptr(GError) error = nullptr;
@@ -66,6 +64,23 @@ static void check_accounts(findings *out) {
     }
     review_lines(files, ctx, out);
     (void)usermgmt_close(ctx);
+}
+
+static void check_accounts(const mount_points &mounts, findings *out) {
+    account_file files[CORE_FILE_COUNT] = {};
+    if (read_files(files, mounts, out))
+        review_read_files(files, out);
+    for (account_file &file : files)
+        account_file_clear(&file);
+}
+
+static bool print(const char *text) {
+    if (std::fputs(text, stdout) != EOF && std::fflush(stdout) == 0)
+        return true;
+    const int saved = errno;
+    (void)std::fprintf(stderr, "privane-check: cannot write to standard output: %s\n",
+                       g_strerror(saved));
+    return false;
 }
 
 // For the unit: whether the service may be started.
@@ -87,6 +102,7 @@ struct settings {
     gboolean is_guard;
     char *root;
     char *json;
+    json_mode mode;
 };
 
 static bool parse(int argc, char **argv, settings *out) {
@@ -104,17 +120,19 @@ static bool parse(int argc, char **argv, settings *out) {
         context,
         "Tells what a change of any account would do to /etc/passwd, /etc/shadow and /etc/group.\n"
         "Exit status: 0 nothing; 1 lines would change; 2 usage; 3 accounts would be lost;\n"
-        "4 the service could not work with these files.\n");
+        "4 the service could not work with these files; 5 what was found could not be told.\n");
     g_option_context_add_main_entries(context, entries, nullptr);
     g_autoptr(GError) error = nullptr;
     if (!g_option_context_parse(context, &argc, &argv, &error)) {
         (void)std::fprintf(stderr, "privane-check: %s\n", error->message);
         return false;
     }
-    static constexpr const char *forms[] = {"short", "pretty", "off", nullptr};
-    if (argc > 1 || (out->json != nullptr && !g_strv_contains(forms, out->json))) {
-        (void)std::fprintf(stderr, "privane-check: %s\n",
-                           argc > 1 ? "no arguments are known" : "--json is short, pretty or off");
+    if (argc > 1) {
+        (void)std::fputs("privane-check: no arguments are known\n", stderr);
+        return false;
+    }
+    if (out->json != nullptr && !json_mode_find(out->json, &out->mode)) {
+        (void)std::fprintf(stderr, "privane-check: --json is %s\n", JSON_MODE_WORDS);
         return false;
     }
     return true;
@@ -129,23 +147,21 @@ int main(int argc, char **argv) {
         (void)std::fputs("privane-check: only root may read the files\n", stderr);
         return WRONG_CALL;
     }
+    const mount_points mounts(chosen.root);
     if (chosen.root != nullptr && (chroot(chosen.root) != 0 || chdir("/") != 0)) {
         (void)std::fprintf(stderr, "privane-check: %s: %m\n", chosen.root);
         return WRONG_CALL;
     }
 
     findings found;
-    check_accounts(&found);
+    check_accounts(mounts, &found);
     if (chosen.is_guard)
         found.keep(gravity::LOSS);
-    std::vector<std::string> order;
-    for (const core_file &file : core_file_table)
-        order.emplace_back(file.path);
-    found.sort(order);
-    const bool is_json = chosen.json != nullptr && g_strcmp0(chosen.json, "off") != 0;
-    if (is_json)
-        print_json(found, g_strcmp0(chosen.json, "pretty") == 0);
-    else
-        print_text(found);
-    return chosen.is_guard ? guard(found) : status_of(found);
+    found.sort();
+    g_autofree char *text = report_format(found, chosen.mode);
+    const bool is_told = print(text);
+    // Whether the service may start does not hang on who listens.
+    if (chosen.is_guard)
+        return guard(found);
+    return is_told ? status_of(found) : CANNOT_TELL;
 }

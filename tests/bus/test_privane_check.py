@@ -1,6 +1,7 @@
 """tests/bus/test_privane_check.py: what the checker tells of account files, good and bad."""
 import json
 import os
+import re
 import shutil
 import subprocess
 import time
@@ -10,20 +11,23 @@ from pathlib import Path
 import pytest
 
 from harness.accounts import GROUP, PASSWD, SHADOW, AccountFiles, replace
+from harness.sandbox import fake_library
 from harness.syslog_socket import SyslogSocket
 
 MARKER = Path("/etc/privane/accept-account-loss")
+MAN = Path("/usr/share/man")
+MANUAL = MAN / "man8/privane-check.8"
 FILES = (PASSWD, SHADOW, GROUP)
-NOTHING, CHANGES, USAGE, LOSS, UNUSABLE = range(5)
+NOTHING, CHANGES, USAGE, LOSS, UNUSABLE, UNTOLD = range(6)
 
 GOOD_PASSWD = "root:x:0:0:root:/root:/bin/sh\nalice:x:1001:100:Alice:/home:/bin/false\n"
 GOOD_SHADOW = "root:*:19000:0:99999:7:0::\nalice:$5$salt$hash:19000:0:99999:7:0::\n"
 GOOD_GROUP = "root:x:0:\nusers:x:100:alice\n"
 
 
-def check(*options: str) -> subprocess.CompletedProcess[str]:
+def check(*options: str, **environment: str) -> subprocess.CompletedProcess[str]:
     return subprocess.run(["/usr/sbin/privane-check", *options], capture_output=True, text=True,
-                          check=False)
+                          check=False, env={**os.environ, **environment})
 
 
 def write(passwd: str = GOOD_PASSWD, shadow: str | None = GOOD_SHADOW,
@@ -87,6 +91,13 @@ PASSWD_CASES = {
     "costly-hash": ("bob:$6$rounds=99999999$salt$hash:1002:100::/:/bin/sh\n",
                     "notice: costly-hash: 'bob': each check of the password takes 99999999 rounds, "
                     "in which the service serves nobody else", NOTHING),
+    "costly-hash-of-memory": ("bob:$y$jFT$salt$hash:1002:100::/:/bin/sh\n",
+                              "notice: costly-hash: 'bob': each check of the password works through "
+                              "1024 MiB of memory, in which the service serves nobody else", NOTHING),
+    "unknown-hash": ("bob:$argon2id$v=19$hash:1002:100::/:/bin/sh\n",
+                     "notice: unknown-hash: 'bob': the method of its hash, $argon2id$, is none of "
+                     "crypt(5): whether anybody can log in by it is not known, nor what a check costs",
+                     NOTHING),
 }
 
 
@@ -247,6 +258,10 @@ def test_a_symbolic_link() -> None:
     assert done.returncode == CHANGES
 
 
+MOUNTED = ("/etc/passwd: unusable: mount-point: is mounted over another file, which no write can "
+           "replace; mount its folder instead\n")
+
+
 @pytest.fixture
 def mounted(tmp_path: Path) -> Iterator[None]:
     over = tmp_path / "passwd"
@@ -256,12 +271,46 @@ def mounted(tmp_path: Path) -> Iterator[None]:
     subprocess.run(["umount", PASSWD], check=True)
 
 
+# A kernel that tells mount points, and an older one.
+KERNELS = ({}, {"LD_PRELOAD": str(fake_library("old_statx/libold_statx.so"))})
+
+
+@pytest.mark.parametrize("kernel", KERNELS, ids=("new", "old"))
 @pytest.mark.usefixtures("mounted")
-def test_a_file_that_is_mounted_over_another() -> None:
-    done = check()
-    assert done.stdout == ("/etc/passwd: unusable: mount-point: is mounted over another file, which "
-                           "no write can replace; mount its folder instead\n")
+def test_a_file_that_is_mounted_over_another(kernel: dict[str, str]) -> None:
+    done = check(**kernel)
+    assert done.stdout == MOUNTED
     assert done.returncode == UNUSABLE
+
+
+@pytest.mark.parametrize("kernel", KERNELS, ids=("new", "old"))
+def test_a_file_of_an_image_that_is_mounted_over_another(kernel: dict[str, str],
+                                                         tmp_path: Path) -> None:
+    root = tmp_path / "an image"
+    (root / "var" / "etc").mkdir(parents=True)
+    (root / "etc").symlink_to("var/etc")
+    for path in FILES:
+        shutil.copy2(path, root / "etc")
+    assert check(f"--root={root}", **kernel).returncode == NOTHING
+    subprocess.run(["mount", "--bind", PASSWD, root / "var/etc/passwd"], check=True)
+    try:
+        done = check(f"--root={root}", **kernel)
+    finally:
+        subprocess.run(["umount", root / "var/etc/passwd"], check=True)
+    assert (done.stdout, done.returncode) == (MOUNTED, UNUSABLE)
+
+
+def test_mounts_that_cannot_be_known() -> None:
+    """An old kernel, and no /proc."""
+    hidden = subprocess.run(["unshare", "--mount", "sh", "-c",
+                             "mount -t tmpfs none /proc && exec privane-check"],
+                            capture_output=True, text=True, check=False,
+                            env={**os.environ, **KERNELS[1]})
+    assert hidden.stdout.splitlines() == [
+        f"{path}: notice: mounts-unknown: may be mounted over another file, which no write could "
+        "replace: Failed to open file “/proc/self/mountinfo”: No such file or directory"
+        for path in FILES]
+    assert hidden.returncode == NOTHING
 
 
 @pytest.mark.parametrize("path", (PASSWD, GROUP))
@@ -331,6 +380,45 @@ def test_the_guard_of_the_unit() -> None:
     assert wanted.stderr == f"{MARKER} says that this is wanted.\n"
 
 
+def test_the_guard_tells_of_losses_alone() -> None:
+    """What else keeps the service from working it tells itself when it starts."""
+    write(GOOD_PASSWD + "bob:*:1002:100::/:/bin/sh:more\n")
+    assert check().returncode == UNUSABLE
+    guard = check("--guard")
+    assert (guard.returncode, guard.stdout, guard.stderr) == (NOTHING, "", "")
+
+    write(GOOD_PASSWD + "bob:*:1002:100::/:/bin/sh:more\nhuman:*:70000:100::/:/bin/sh\n")
+    guard = check("--guard", "--json=short")
+    assert [(found["weight"], found["account"]) for found in json.loads(guard.stdout)["findings"]] == [
+        ("loss", "human")]
+    assert guard.returncode == LOSS
+
+
+def check_into(path: str, *options: str) -> tuple[int, str]:
+    with open(path, "w") as output:
+        done = subprocess.run(["/usr/sbin/privane-check", *options], stdout=output,
+                              stderr=subprocess.PIPE, text=True, check=False)
+    return done.returncode, done.stderr
+
+
+FULL = ("privane-check: cannot write to standard output: No space left on device\n")
+
+
+@pytest.mark.parametrize("options", [(), ("--json=short",), ("--json=pretty",)])
+def test_what_cannot_be_told_is_a_failure(options: tuple[str, ...]) -> None:
+    write(GOOD_PASSWD + "# a comment\n")
+    assert check_into("/dev/full", *options) == (UNTOLD, FULL)
+    assert check_into("/dev/null", *options) == (CHANGES, "")
+
+
+def test_the_guard_decides_whoever_listens() -> None:
+    """A log that takes nothing keeps no service from starting, and lets none start."""
+    assert check_into("/dev/full", "--guard", "--json=short") == (NOTHING, FULL)
+    write(GOOD_PASSWD + "human:*:70000:100::/:/bin/sh\n")
+    status, errors = check_into("/dev/full", "--guard")
+    assert status == LOSS and errors.startswith(FULL)
+
+
 def test_the_files_of_an_image(tmp_path: Path) -> None:
     (tmp_path / "etc").mkdir()
     for path in FILES:
@@ -349,6 +437,33 @@ def test_json_is_valid_whatever_a_name_holds() -> None:
     done = check("--json=short")
     assert json.loads(done.stdout)["findings"][0]["account"] == "a\x1fb\u009bc"
     assert "\x1f" not in done.stdout and "\u009b" not in done.stdout
+
+
+def test_the_manual_is_set_without_a_warning() -> None:
+    done = subprocess.run(["groff", "-ww", "-man", "-Tutf8", "-z", MANUAL], capture_output=True,
+                          check=False)
+    assert (done.returncode, done.stderr) == (0, b"")
+
+
+def test_the_manual_has_what_the_help_has() -> None:
+    text = MANUAL.read_text().replace("\\-", "-")
+    help_text = check("--help").stdout
+    options = set(re.findall(r"--[a-z]+(?==|  )", help_text)) - {"--help"}
+    statuses = re.findall(r"\b([0-9]) ", help_text.partition("Exit status:")[2])
+
+    assert options == {"--guard", "--json", "--root"}
+    assert options <= set(re.findall(r"--[a-z]+", text))
+    assert statuses == re.findall(r"^\.B ([0-9])$", text, re.MULTILINE) == [
+        str(status) for status in range(6)]
+
+
+@pytest.mark.parametrize("page", ["man8/privane-check.8", "man1/privanectl.1"])
+def test_the_manuals_name_no_page_of_ours_that_is_not_there(page: str) -> None:
+    named = re.findall(r"^\.BR (privane\S*) \(([1-8])\)", (MAN / page).read_text(), re.MULTILINE)
+
+    assert named
+    assert [name for name, section in named
+            if not (MAN / f"man{section}" / f"{name}.{section}".replace("\\-", "-")).exists()] == []
 
 
 def test_only_root_may_look(accounts: AccountFiles) -> None:
