@@ -29,10 +29,11 @@ void findings::add(gravity weight, const char *kind, const char *file, unsigned 
 }
 
 bool findings::has(gravity weight) const {
+    guint count = 0;
+
     for (const finding *found : all())
-        if (found->weight == weight)
-            return true;
-    return false;
+        count += found->weight == weight ? 1 : 0;
+    return count > 0;
 }
 
 void findings::keep(gravity weight) {
