@@ -9,12 +9,12 @@
 
 // Errors of this unit: domain "corefile". The numbers reach bus callers and never change.
 enum corefile_error {
-    COREFILE_ERROR_READ = 100,
-    COREFILE_ERROR_WRITE = 101,
-    COREFILE_ERROR_MISSING_FUNCTION = 102,
-    COREFILE_ERROR_SEVERAL_FILES = 103,
-    COREFILE_ERROR_MISSING_DATA = 104,
-    COREFILE_ERROR_UNKNOWN = 105,
+    COREFILE_ERROR_READ = 100,   // a file could not be read
+    COREFILE_ERROR_WRITE = 101,  // a file could not be written, or would not give the record back
+    COREFILE_ERROR_MISSING_FUNCTION = 102,  // a file that cannot be read or written
+    COREFILE_ERROR_SEVERAL_FILES = 103,     // several files could not be written
+    COREFILE_ERROR_MISSING_DATA = 104,      // nothing to write
+    COREFILE_ERROR_UNKNOWN = 105,           // a failure without a reason
 };
 
 #define COREFILE_ERROR corefile_error_quark()

@@ -9,23 +9,23 @@
 
 // Errors of this unit: domain "usermgmt". The numbers reach bus callers and never change.
 enum usermgmt_error {
-    USERMGMT_ERROR_ALREADY_OPEN = 1,
-    USERMGMT_ERROR_DUPLICATE_GROUP = 2,
-    USERMGMT_ERROR_USER = 3,
-    USERMGMT_ERROR_GROUP = 4,
-    USERMGMT_ERROR_USER_TYPE = 5,
-    USERMGMT_ERROR_USER_EXISTS = 6,
-    USERMGMT_ERROR_GROUP_EXISTS = 7,
-    USERMGMT_ERROR_PRIMARY_GROUP = 8,
-    USERMGMT_ERROR_ALLOCATION_TYPE = 9,
-    USERMGMT_ERROR_PASSWORD = 10,
-    USERMGMT_ERROR_DELETE_TYPE = 11,
-    USERMGMT_ERROR_SHELL = 12,
-    USERMGMT_ERROR_NO_UID = 13,
-    USERMGMT_ERROR_NO_GID = 14,
-    USERMGMT_ERROR_INTERNAL = 16,
-    USERMGMT_ERROR_ARGUMENT = 17,
-    USERMGMT_ERROR_GROUP_MODIFICATION = 18,
+    USERMGMT_ERROR_ALREADY_OPEN = 1,     // another context is open
+    USERMGMT_ERROR_DUPLICATE_GROUP = 2,  // a group line stands twice
+    USERMGMT_ERROR_USER = 3,             // unknown user, or unusable name of one
+    USERMGMT_ERROR_GROUP = 4,            // unknown group, or unusable name of one
+    USERMGMT_ERROR_USER_TYPE = 5,        // the user's type does not allow it
+    USERMGMT_ERROR_USER_EXISTS = 6,      // the user exists
+    USERMGMT_ERROR_GROUP_EXISTS = 7,     // the group exists, or none to delete
+    USERMGMT_ERROR_PRIMARY_GROUP = 8,    // it is the primary group of a member
+    USERMGMT_ERROR_ALLOCATION_TYPE = 9,  // no user of that type can be added
+    USERMGMT_ERROR_PASSWORD = 10,        // no password, or too long a one
+    USERMGMT_ERROR_DELETE_TYPE = 11,     // an account of that type must stay
+    USERMGMT_ERROR_SHELL = 12,           // web users have no shell
+    USERMGMT_ERROR_NO_UID = 13,          // no UID is left, or too many users
+    USERMGMT_ERROR_NO_GID = 14,          // no GID is left
+    USERMGMT_ERROR_INTERNAL = 16,        // the database is at odds with itself, or hashing failed
+    USERMGMT_ERROR_ARGUMENT = 17,        // unusable argument, or a UID that is taken
+    USERMGMT_ERROR_GROUP_MODIFICATION = 18,  // groups cannot be modified
 };
 
 #define USERMGMT_ERROR usermgmt_error_quark()
