@@ -295,3 +295,15 @@ def test_completion_in_an_interactive_shell(typed: str, line: str,
         assert shell.passed.strip() == line
     finally:
         shell.close()
+
+
+@pytest.mark.parametrize("method", [method.member for method in METHODS])
+def test_completion_leads_to_every_method(method: str) -> None:
+    """The shell offers each noun, and behind it each verb, of the commands that call a method."""
+    rows = [row for row in table() if row["method"] == method]
+    assert rows
+    for row in rows:
+        words = name_of(row["usage"])
+        for count, word in enumerate(words):
+            line = " ".join(["privanectl", *words[:count], word])
+            assert word in complete(line), line
