@@ -1,5 +1,6 @@
 """tests/bus/test_examples.py: the examples of the callers' guide, run against the service."""
 import os
+import shutil
 import subprocess
 from pathlib import Path
 from typing import Iterator
@@ -125,3 +126,21 @@ def test_changes_are_watched(caller: list[str], camera: Service, bus: Bus,
 def test_wrong_usage_is_told(words: tuple[str, ...], caller: list[str]) -> None:
     assert run(caller, *words) == Run(
         2, "", "usage: caller list | check USER | add USER GROUP | watch\n")
+
+
+def build_commands() -> str:
+    """What the guide tells under "Build", as one script."""
+    section = (EXAMPLES.parents[1] / "callers.md").read_text().partition("\n## Build\n")[2]
+    return "\n".join(line[4:] for line in section.splitlines() if line.startswith("    "))
+
+
+def test_guide_builds_them(tmp_path: Path, service: Service, bus: Bus) -> None:
+    """With what is installed, and the files of the examples alone."""
+    folder = shutil.copytree(EXAMPLES, tmp_path / "callers")
+    ended = subprocess.run(["bash", "-euc", build_commands()], cwd=folder, text=True, check=False,
+                           stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
+
+    assert (ended.returncode, ended.stdout) == (0, "")
+    users = "".join(f"{user}\n" for user in users_of(bus))
+    for program in ("caller_c", "caller_cpp"):
+        assert run([str(folder / program)], "list") == Run(0, users, "")
