@@ -12,6 +12,7 @@ from harness.privanectl import surroundings
 from harness.service import Service
 
 MANUAL = Path("/usr/share/man/man5/com.zintor.PrivaneSystem.5")
+SERVICE = Path("/usr/share/man/man8/privane_system.8")
 PAGE = Path("/usr/share/doc/privane-system/com.zintor.PrivaneSystem.html")
 
 
@@ -41,8 +42,11 @@ def test_example_calls_its_method(method: object, authz: FakeAuthz, service: Ser
     assert check.action.split(".")[:4] == method.action_id.split(".")[:4]
 
 
-def test_manual_is_set_without_a_warning() -> None:
-    ended = subprocess.run(["man", "--warnings", "-l", str(MANUAL)], capture_output=True,
+@pytest.mark.parametrize("page", [MANUAL, SERVICE], ids=lambda page: page.name)
+@pytest.mark.parametrize("command", [("groff", "-ww", "-man", "-Tutf8", "-z"),
+                                     ("man", "--warnings", "-l")], ids=lambda words: words[0])
+def test_manual_is_set_without_a_warning(command: tuple[str, ...], page: Path) -> None:
+    ended = subprocess.run([*command, str(page)], capture_output=True,
                            env=surroundings(MANWIDTH="100", LC_ALL="C.UTF-8"), check=False)
 
     assert (ended.returncode, ended.stderr) == (0, b"")
