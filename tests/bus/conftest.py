@@ -5,7 +5,8 @@ import pytest
 
 from harness.service import Service
 
-pytest_plugins = ["harness.service_fixtures", "harness.stage_fixtures", "harness.device_fixtures"]
+pytest_plugins = ["harness.service_fixtures", "harness.told_errors", "harness.stage_fixtures",
+                  "harness.device_fixtures"]
 
 OWN_AUTHZ = ("real_authz", "polkit", "policy_file")
 
