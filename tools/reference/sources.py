@@ -19,6 +19,8 @@ ROW = re.compile(
 
 NOUN = re.compile(r'\.noun = "([\w-]+)"')
 COMMAND = re.compile(r"\n    \{(\.noun = .*?)\},(?=\n)", re.DOTALL)
+# Of a command without arguments.
+PLAIN = re.compile(r'\n    plain\("([\w-]+)", "([\w-]+)", "(\w+)", "[^"]*"\),(?=\n)')
 
 
 def signal_of(member: str) -> str:
@@ -54,8 +56,9 @@ def commands(root: Path = ROOT) -> dict[str, list[str]]:
     """Of each method the commands of privanectl that call it, from the table of its verbs."""
     text = (root / "client/verb_table.cpp").read_text().partition("COMMANDS[] = {")[2]
     found: dict[str, list[str]] = {}
+    text = PLAIN.sub(r'\n    {.noun = "\1", .verb = "\2", .method = "\3"},', text)
     rows = COMMAND.findall(text)
-    if len(rows) != len(NOUN.findall(text)):
+    if len(rows) != len(NOUN.findall(text)) or "plain(" in text:
         raise Fault("client/verb_table.cpp: there is a row of a form that is not known here")
     for row in rows:
         method = field(row, "method")
