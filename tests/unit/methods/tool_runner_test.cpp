@@ -131,7 +131,11 @@ TEST_F(ToolRunner, WithoutForkTheOutcomeIsTheSame) {
     EXPECT_EQ(result_.wait_status, 3 << 8);
 }
 
-TEST_F(ToolRunner, WithoutForkTheErrorIsTheSame) {
+// The child tells its error through memory that it shares with us, as vfork(2) has it; valgrind,
+// for which ./test leaves this out, makes a fork of that.
+class ToolRunnerSharingMemory : public ToolRunner {};
+
+TEST_F(ToolRunnerSharingMemory, WithoutForkTheErrorIsTheSame) {
     for (const char *program : {"/nonexistent/tool", "/etc/passwd", "sh"}) {
         const char *const argv[] = {program, nullptr};
         g_autoptr(GError) forked = nullptr;
@@ -139,6 +143,7 @@ TEST_F(ToolRunner, WithoutForkTheErrorIsTheSame) {
         g_autoptr(GError) spawned = nullptr;
         EXPECT_FALSE(run_tool_without_fork(argv, &result_, &spawned)) << program;
 
+        ASSERT_NE(spawned, nullptr) << program;
         EXPECT_TRUE(g_error_matches(spawned, forked->domain, forked->code)) << program;
         EXPECT_STREQ(spawned->message, forked->message);
         EXPECT_EQ(output(), "none") << program;
