@@ -8,7 +8,7 @@ import pytest
 from harness.accounts import CLERK_UID, STRANGER_UID, replace
 from harness.bus import User
 from harness.interface import ACTION_PREFIX
-from harness.policy_file import POLICY, policy
+from harness.policy_file import POLICY, policy, role
 from harness.privanectl import DONE, Run, as_user, privanectl
 from harness.service import Service
 
@@ -55,10 +55,18 @@ def test_root_is_allowed_by_the_packaged_file(real_service: Service) -> None:
 
 
 def test_root_is_refused_where_no_role_is_its(real_service: Service) -> None:
-    replace(POLICY, "", 0o644, 0)
+    replace(POLICY, role("looking", "users=clerk", f"actions={ACTION_PREFIX}checkuser"), 0o644, 0)
     told = explain("Reboot")
 
     assert (told["allowed"], told["reason"]) == ("no", REFUSED)
+
+
+def test_what_is_wrong_with_the_file_is_told(real_service: Service) -> None:
+    replace(POLICY, "", 0o644, 0)
+    told = explain("Reboot")
+
+    assert (told["allowed"], told["reason"]) == (
+        "no", f"{REFUSED}: cannot check action {ACTION_PREFIX}reboot: {POLICY}:1: no role in the file")
 
 
 @pytest.mark.parametrize("words", [("CheckUser",), ("GetActiveNetworkInfo", "tcp-udp"),

@@ -3,6 +3,7 @@ import shlex
 from pathlib import Path
 
 import pytest
+from _pytest.mark import ParameterSet
 
 from harness.accounts import AccountFiles
 from harness.bus import Bus
@@ -42,9 +43,15 @@ def test_there_are_some() -> None:
     assert len(transcripts("docs/privanectl.md")) == 4
 
 
-@pytest.mark.real_authz
-@pytest.mark.parametrize("command, shown", [*transcripts("README.md"),
-                                            *transcripts("docs/privanectl.md")])
+def with_the_libauthz_that_answers(command: str, shown: str) -> ParameterSet:
+    """What explains a decision shows that of polkit."""
+    mark = pytest.mark.polkit if " explain " in command else pytest.mark.real_authz
+    return pytest.param(command, shown, marks=mark)
+
+
+@pytest.mark.parametrize("command, shown", [
+    with_the_libauthz_that_answers(*one)
+    for document in ("README.md", "docs/privanectl.md") for one in transcripts(document)])
 def test_transcript(command: str, shown: str, accounts: AccountFiles, start: StartService,
                     bus: Bus, privane_gid: int) -> None:
     accounts.write_exactly(PASSWD, SHADOW, GROUP)

@@ -1,6 +1,7 @@
 """tests/bus/harness/world.py: all that a method could touch, to show that it touched nothing."""
 import os
 import signal
+import stat
 import subprocess
 from dataclasses import dataclass
 from pathlib import Path
@@ -33,13 +34,16 @@ def file_state(path: Path) -> FileState | None:
                       seen.st_mtime_ns, seen.st_ctime_ns))
 
 
-# Of each entry of a folder its inode and the times of its content and its attributes.
+# Of each entry of a folder its inode and the times of its content and its attributes; of a device,
+# which the whole machine writes to, its number instead of the time.
 Entries = dict[str, tuple[int, int, int]]
 
 
 def entries(folder: Path) -> Entries:
     seen = ((entry.name, entry.stat(follow_symlinks=False)) for entry in os.scandir(folder))
-    return {name: (stat.st_ino, stat.st_mtime_ns, stat.st_ctime_ns) for name, stat in seen}
+    return {name: (status.st_ino,
+                   status.st_rdev if stat.S_ISCHR(status.st_mode) else status.st_mtime_ns,
+                   status.st_ctime_ns) for name, status in seen}
 
 
 def last_pid() -> int:
