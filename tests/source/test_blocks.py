@@ -55,6 +55,9 @@ BLOCKS: dict[str, dict[str, RunBy | NotRun | Drawing]] = {
     },
     "docs/callers.md": {"cc -o caller_c": GUIDE, "gdbus-codegen ": GUIDE},
     "docs/errors.md": {"org.gtk.GDBus.UnmappedGError.": Drawing()},
+    "docs/makers.md": {
+        "make install ": RunBy("tests/bus/test_example_library.py", "def commands("),
+    },
     "docs/privanectl.md": {"$ privanectl group list": TRANSCRIPTS},
     "docs/reliability.md": {
         "./test proof": NotRun(
