@@ -108,7 +108,10 @@ class ExampleRules:
     """The packaged example rules. polkitd notices new files by itself, within some milliseconds."""
 
     # An action of the role, by which a change of the rules is seen.
-    SAMPLES = {"viewer": ACTION_PREFIX + "checkuser", "operator": ACTION_PREFIX + "reboot"}
+    SAMPLES = {"viewer": ACTION_PREFIX + "checkuser", "operator": ACTION_PREFIX + "reboot",
+               "web": ACTION_PREFIX + "authuserbasic", "time": ACTION_PREFIX + "settimeofday",
+               "updater": ACTION_PREFIX + "updatereleasefile",
+               "monitor": ACTION_PREFIX + "getslabinfo"}
 
     def __init__(self, bus: Bus, members: dict[str, User]) -> None:
         """members: for each role a user who has it."""

@@ -18,6 +18,8 @@ SERVICE_ACTIONS = {"startservice": "Start", "stopservice": "Stop", "restartservi
 UNIT_ACTIONS = {*SERVICE_ACTIONS, "setdefaulttarget"}
 VIEWER_ACTIONS = {"checkgroup", "checkuser", "getgroup", "getgrouplist", "getgrouplistfull", "getuser",
                   "getuserlist"}
+# Of the examples, those that grant actions as they are.
+ROLES = ("monitor", "operator", "time", "updater", "viewer", "web")
 ROOT_ACTIONS = {"addbootblockparam", "adduiduser", "adduser", "chpasswduser", "digest", "modifyuser",
                 "pinsrv", "readlogfile"}
 
@@ -150,15 +152,16 @@ class ExampleRules(unittest.TestCase):
         names, _ = self.granted("viewer")
         self.assertEqual(names, VIEWER_ACTIONS)
 
-    def test_operator_holds_declared_actions(self):
-        names, _ = self.granted("operator")
-        self.assertGreater(len(names), 0)
-        self.assertLessEqual(names, fixed_actions())
+    def test_every_role_holds_declared_actions(self):
+        for role in ROLES:
+            names, _ = self.granted(role)
+            self.assertGreater(len(names), 0)
+            self.assertLessEqual(names, fixed_actions())
 
     def test_what_amounts_to_root_is_named_and_not_granted(self):
-        viewer, _ = self.granted("viewer")
-        operator, text = self.granted("operator")
-        self.assertFalse((ROOT_ACTIONS | UNIT_ACTIONS) & (viewer | operator))
+        for role in ROLES:
+            self.assertFalse((ROOT_ACTIONS | UNIT_ACTIONS) & self.granted(role)[0], role)
+        _, text = self.granted("operator")
         comment = "\n".join(line for line in text.splitlines() if line.startswith("//"))
         for name in ROOT_ACTIONS:
             self.assertIn(name, comment)
@@ -175,7 +178,8 @@ class ExampleRules(unittest.TestCase):
     def test_sysusers_makes_their_groups(self):
         lines = (DATA / "examples" / "privane-roles.sysusers.conf").read_text(encoding="utf-8").splitlines()
         self.assertEqual([line for line in lines if not line.startswith("#")],
-                         ["g privane-viewer -", "g privane-operator -", "g privane-units -"])
+                         [f"g privane-{role} -" for role in (
+                             "viewer", "operator", "units", "web", "time", "updater", "monitor")])
 
 
 class PolicyFiles(unittest.TestCase):
@@ -195,7 +199,7 @@ class PolicyFiles(unittest.TestCase):
             ("reloadservice", "sshd"), ("restartservice", "sshd"),
             ("startservice", "recorder.any"), ("stopservice", "recorder.any"))}
         expected = {name: {PREFIX + action for action in rules.granted(name)[0]}
-                    for name in ("viewer", "operator")} | {"units": units}
+                    for name in ROLES} | {"units": units}
         self.assertEqual(roles.pop("role root"), {"users": ["root"], "actions": [PREFIX + "*"]})
         self.assertEqual({name: role["groups"] for name, role in roles.items()},
                          {f"role {name}": [f"privane-{name}"] for name in expected})
