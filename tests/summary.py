@@ -13,7 +13,7 @@ from pathlib import Path
 RUNS = {
     "source": ["source.xml"],
     "unit": ["unit.xml", "unit-sanitizers.xml", "unit-valgrind-*.xml"],
-    "bus": ["bus.xml", "bus-policy-file.xml"],
+    "bus": ["bus.xml", "bus-policy-file.xml", "bus-kit.xml"],
     "device": ["device.xml"],
     "proof": ["proof.xml"],
 }

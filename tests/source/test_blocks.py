@@ -64,6 +64,9 @@ BLOCKS: dict[str, dict[str, RunBy | NotRun | Drawing]] = {
             "it takes ten minutes and more; tests/long/test_gate.py and tests/long/test_long_run.py "
             "test what is started, with proofs of their own"),
     },
+    "docs/testkit.md": {
+        start: RunBy("tests/kit/test_testkit.py", "def test_guide_is_right(")
+        for start in ("tools/sandbox -- ", "tools/sandbox --rules=", "tools/sandbox --calls=")},
     "docs/security.md": {"anyone on the device": Drawing()},
 }
 

@@ -31,11 +31,11 @@ class Device:
     """Tools that print nothing and succeed, a systemd that obeys, an empty boot block, and a clock
     that is set through a library."""
 
-    def __init__(self, directory: Path) -> None:
+    def __init__(self, directory: Path, record_systemd: Path | None = None) -> None:
         self.tools = {path: StandInTool(path) for path in TOOLS}
         self.boot = FakeBootparam(directory / "boot")
         self.rtc = FakeRtcClock(directory / "rtc")
-        self.systemd = FakeSystemd()
+        self.systemd = FakeSystemd(record_systemd)
 
     def fakes(self) -> tuple[Fake, ...]:
         return (*self.tools.values(), self.boot, self.rtc, self.systemd)

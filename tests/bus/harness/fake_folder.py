@@ -3,7 +3,7 @@ import os
 from dataclasses import dataclass
 from pathlib import Path
 from typing import Mapping
-from urllib.parse import unquote
+from urllib.parse import quote, unquote
 
 from harness.sandbox import fake_library
 
@@ -50,6 +50,11 @@ class FakeFolder:
         lines = record.read_text().splitlines() if record.exists() else []
         return [Call(int(time), tuple(map(unquote, words)))
                 for time, *words in (line.split(" ") for line in lines)]
+
+    def record(self, call: Call) -> None:
+        """As a fake does it."""
+        with (self.directory / "calls").open("a") as record:
+            record.write(" ".join((str(call.time), *map(quote, call.words))) + "\n")
 
     def forget(self) -> None:
         (self.directory / "calls").unlink(missing_ok=True)

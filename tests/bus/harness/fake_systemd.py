@@ -3,11 +3,12 @@ import contextlib
 import socket
 import threading
 import time
+from pathlib import Path
 from typing import Callable
 
 from gi.repository import Gio, GLib
 
-from harness.fake_folder import Call
+from harness.fake_folder import Call, FakeFolder
 from harness.wire import Wire
 
 NAME = "org.freedesktop.systemd1"
@@ -28,10 +29,12 @@ def _succeed(call: Gio.DBusMessage) -> Gio.DBusMessage:
 
 class FakeSystemd(Wire):
     """Answers as systemd does until told otherwise. A call's words are the member, the signature
-    and the arguments; one for another object or interface is recorded with that in front."""
+    and the arguments; one for another object or interface is recorded with that in front. A folder
+    gets them as well, as those of the fakes that talk through one."""
 
-    def __init__(self) -> None:
+    def __init__(self, folder: Path | None = None) -> None:
         super().__init__()
+        self._folder = FakeFolder(folder) if folder else None
         self._socket.settimeout(None)
         self._answer: Answer = _succeed
         self._calls: list[Call] = []
@@ -90,6 +93,8 @@ class FakeSystemd(Wire):
         words = [*(() if target == (PATH, INTERFACE) else target), call.get_member(),
                  call.get_signature(), *(map(str, body.unpack()) if body else ())]
         self._calls.append(Call(time.monotonic_ns(), tuple(words)))
+        if self._folder:
+            self._folder.record(self._calls[-1])
         reply = self._answer(call)
         if reply is None:
             return

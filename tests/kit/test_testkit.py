@@ -1,0 +1,229 @@
+"""tests/kit/test_testkit.py: tools/sandbox runs a command beside the service, and changes nothing else."""
+import os
+import re
+import shutil
+import subprocess
+from pathlib import Path
+
+import pytest
+
+TREE = Path(__file__).resolve().parents[2]
+BUILD = Path(os.environ.get("TESTKIT_BUILD", TREE / "build"))
+SANDBOX = TREE / "tools" / "sandbox"
+EXAMPLES = TREE / "data" / "examples"
+GUIDE = (TREE / "docs" / "testkit.md").read_text()
+
+SECONDS = 120
+NO_SANDBOX = 125
+
+CALL = ("gdbus call --system --dest com.zintor.PrivaneSystem --object-path /com/zintor/PrivaneSystem "
+        "--method com.zintor.PrivaneSystem.")
+
+
+def sandbox(*words: str | Path, folder: Path | None = None,
+            stdin: str = "") -> "subprocess.CompletedProcess[str]":
+    return subprocess.run([SANDBOX, f"--build={BUILD}", *words], cwd=folder, text=True, input=stdin,
+                          capture_output=True, timeout=SECONDS, check=False)
+
+
+def output_of(*words: str | Path, folder: Path | None = None) -> str:
+    ended = sandbox(*words, folder=folder)
+    assert (ended.returncode, ended.stderr) == (0, ""), ended
+    return ended.stdout
+
+
+def as_user(name: str) -> str:
+    return f"setpriv --reuid={name} --regid={name} --init-groups --"
+
+
+@pytest.mark.parametrize("script, status", [("exit 0", 0), ("exit 7", 7), ("kill -TERM $$", 143)])
+def test_status_is_passed_on(script: str, status: int) -> None:
+    assert sandbox("--", "sh", "-c", script).returncode == status
+
+
+def test_streams_are_the_commands() -> None:
+    ended = sandbox("--", "sh", "-c", "cat; echo bad >&2", stdin="some words")
+
+    assert (ended.returncode, ended.stdout, ended.stderr) == (0, "some words", "bad\n")
+
+
+def test_command_that_is_not_there() -> None:
+    ended = sandbox("--", "/no/such/command")
+
+    assert ended.returncode == 127
+    assert ended.stderr == "tools/sandbox: /no/such/command: No such file or directory\n"
+
+
+def host_files() -> dict[str, tuple[bytes, tuple[int, ...]]]:
+    """What the service rewrites, of this machine, with what would tell of a new file."""
+    found = {}
+    for name in ("passwd", "shadow", "group", "privane/parameters.conf",
+                 "apache2/digest_auth_passwd"):
+        path = Path("/etc") / name
+        if path.exists() and os.access(path, os.R_OK):
+            seen = path.stat()
+            found[name] = (path.read_bytes(), (seen.st_ino, seen.st_mtime_ns, seen.st_ctime_ns))
+    return found
+
+
+def test_this_machine_stays_as_it_was() -> None:
+    before, folder = host_files(), sorted(os.listdir("/etc"))
+    assert {"passwd", "group"} <= set(before)
+
+    shown = output_of("--", "sh", "-euc", f"""
+        touch /etc/testkit-was-here /usr/bin/testkit-was-here /testkit-was-here
+        {CALL}AddUser alice Geheim users '' Alice
+        {CALL}ChpasswdUser root Geheim
+        cat /etc/passwd /etc/apache2/digest_auth_passwd /etc/privane/parameters.conf
+        ls /etc/testkit-was-here""")
+
+    assert re.search(r"^alice:x:\d+:\d+:Alice:", shown, re.MULTILINE)
+    assert re.search(r"^alice:PRIVANE:[0-9a-f]{32}$", shown, re.MULTILINE)
+    assert "root.System.RootPwdSet=yes\n/etc/testkit-was-here\n" in shown
+    assert host_files() == before
+    assert sorted(os.listdir("/etc")) == folder
+    assert not [path for path in ("/usr/bin", "/") if (Path(path) / "testkit-was-here").exists()]
+
+
+def test_service_is_called_by_both_clients() -> None:
+    assert output_of("--", "privanectl", "user", "check", "root", "--json=short") == (
+        '{"exists":true}\n')
+    assert output_of("--", "sh", "-c", f"{CALL}CheckUser alice") == "(false,)\n"
+
+
+def test_what_the_service_calls_is_recorded(tmp_path: Path) -> None:
+    calls, log = tmp_path / "calls", tmp_path / "log"
+    shown = output_of(f"--calls={calls}", f"--log={log}", "--", "sh", "-euc", f"""
+        {CALL}CheckUser root >/dev/null
+        {CALL}SetTimeOfDay 7 8
+        {CALL}AdjTime 1 0
+        testkit-calls
+        testkit-calls --forget
+        {CALL}Reboot
+        {CALL}RestartService sshd
+        {CALL}AddBootblockParam 'TWO WORDS' x
+        [ $(date +%s) -gt 1000000000 ]""")
+
+    assert shown == ("(0,)\n()\nsettimeofday 7 8\nrtc_write_time 7 8\nadjtime 1 0\n"
+                     "(0,)\n()\n()\n")
+    lines = calls.read_text().splitlines()
+    assert lines[0] == "/sbin/sysflash reboot"
+    assert "RestartUnit ss sshd.service replace" in lines
+    assert "bootparam_write 'TWO WORDS' x 0" in lines
+    assert "message: Starting privane_system" in log.read_text().splitlines()
+
+
+def test_answers_of_stand_ins_are_chosen() -> None:
+    shown = output_of("--", "sh", "-euc", f"""
+        echo 3 >/run/stand-ins/sysflash/status
+        printf neighbour >/run/stand-ins/lldpcli/output
+        printf 4711 >/run/testkit/boot/value
+        echo 1 >/run/testkit/clock/errno
+        {CALL}Reboot
+        {CALL}ExecuteLldpcli show-neighbors
+        {CALL}ReadSerno
+        {CALL}SetTimeOfDay 7 8""")
+
+    assert shown == "(768,)\n('neighbour',)\n('4711',)\n(-1,)\n"
+
+
+def test_rules_decide_for_users() -> None:
+    rules = f"--rules={EXAMPLES / '60-privane-viewer.rules'}"
+    script = f"{{}} {CALL}CheckUser root"
+
+    assert output_of(rules, "--", "sh", "-c", script.format(as_user("viewer"))) == "(true,)\n"
+    refused = sandbox(rules, "--", "sh", "-c", script.format(as_user("clerk")))
+    assert refused.returncode == 1 and "is refused to uid 701" in refused.stderr
+    without = sandbox("--", "sh", "-c", script.format(as_user("viewer")))
+    assert without.returncode == 1 and "is refused to uid 703" in without.stderr
+    stranger = sandbox(rules, "--", "sh", "-c", script.format(as_user("stranger")))
+    assert stranger.returncode == 1 and "AccessDenied" in stranger.stderr
+
+
+def test_library_takes_the_place_of_ours() -> None:
+    library = BUILD / "docs" / "examples" / "library"
+
+    assert output_of(f"--library={library}", "--", "sh", "-euc", f"""
+        {CALL}ChpasswdUser root Geheim
+        ls /etc/camera/parameters""") == "()\nroot.System.RootPwdSet\n"
+
+
+def test_folder_is_laid_over_the_root(tmp_path: Path) -> None:
+    (tmp_path / "etc").mkdir()
+    (tmp_path / "etc" / "camera.conf").write_text("laid\n")
+
+    assert output_of(f"--lay={tmp_path}", "--", "cat", "/etc/camera.conf") == "laid\n"
+
+
+def test_current_folder_is_seen_and_written_only_when_allowed(tmp_path: Path) -> None:
+    (tmp_path / "words").write_text("some words\n")
+    write = ("sh", "-c", "cat words; echo new >result")
+
+    assert sandbox("--", *write, folder=tmp_path).returncode != 0
+    assert not (tmp_path / "result").exists()
+    assert output_of(f"--write={tmp_path}", "--", *write, folder=tmp_path) == "some words\n"
+    assert (tmp_path / "result").read_text() == "new\n"
+
+
+@pytest.mark.parametrize("folder", ["/", "/etc", "/home", "/usr/local", "/proc/self/root/etc/.."])
+def test_folder_of_the_system_is_not_written(folder: str) -> None:
+    ended = sandbox(f"--write={folder}", "--", "true")
+
+    assert ended.returncode == NO_SANDBOX
+    assert ended.stderr.endswith("is the system's; --write is for a folder of yours\n")
+
+
+@pytest.mark.parametrize("folder", ["/etc", "/"])
+def test_folder_of_the_system_is_shown_read_only(folder: str) -> None:
+    """Where it stands in the way of the sandbox, there is none."""
+    before = host_files()
+
+    assert sandbox(f"--library={folder}", "--", "true").returncode == NO_SANDBOX
+    assert host_files() == before
+
+
+@pytest.mark.parametrize("words", [(), ("--nothing",), ("--library=/no/such", "--", "true")])
+def test_wrong_usage_runs_nothing(words: tuple[str, ...]) -> None:
+    assert sandbox(*words).returncode == NO_SANDBOX
+
+
+def test_service_that_ends_is_told() -> None:
+    ended = sandbox("--", "sh", "-c", """
+        pid=$(gdbus call --system --dest org.freedesktop.DBus --object-path / --method \
+              org.freedesktop.DBus.GetConnectionUnixProcessID com.zintor.PrivaneSystem |
+              sed 's/[^0-9]*32 \\([0-9]*\\).*/\\1/')
+        kill -KILL $pid
+        while [ -d /proc/$pid ] && ! grep -q '^State:.Z' /proc/$pid/status; do sleep 0.01; done""")
+
+    assert ended.returncode == NO_SANDBOX
+    assert ended.stderr == "tools/sandbox: the service ended, with status -9\n"
+
+
+def guide_commands() -> list[str]:
+    return re.findall(r"^    (tools/sandbox .*)$", GUIDE, re.MULTILINE)
+
+
+@pytest.mark.parametrize("command", guide_commands())
+def test_guide_is_right(command: str, tmp_path: Path) -> None:
+    """In a folder with what it names."""
+    shutil.copy(TREE / "docs" / "examples" / "testkit" / "my-tests", tmp_path)
+    shutil.copy(EXAMPLES / "60-privane-operator.rules", tmp_path)
+    (tmp_path / "tools").symlink_to(TREE / "tools")
+    ended = subprocess.run(["bash", "-euc", command.replace(
+        "tools/sandbox ", f"tools/sandbox --build={BUILD} ", 1)], cwd=tmp_path, text=True,
+        capture_output=True, timeout=SECONDS, check=False)
+
+    assert ended.returncode == 0, ended
+    if "--calls=" in command:
+        assert (tmp_path / "calls.txt").read_text() == "/sbin/sysflash reboot\n"
+        assert "Starting privane_system" in (tmp_path / "log.txt").read_text()
+
+
+def test_guide_shows_three_commands() -> None:
+    assert len(guide_commands()) == 3
+
+
+def test_example_fails_without_the_role(tmp_path: Path) -> None:
+    ended = sandbox("--", TREE / "docs" / "examples" / "testkit" / "my-tests", folder=tmp_path)
+
+    assert ended.returncode != 0 and "is refused to uid 704" in ended.stderr
