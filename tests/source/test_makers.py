@@ -54,3 +54,13 @@ def test_each_platform_library_is_told_of() -> None:
     assert {re.findall(r"\[(\w+)\.h\]", row[1])[0] for row in listed} == headers
     assert [row[0] for row in explained] == [row[0] for row in listed]
     assert len(headers) == 6
+
+
+def test_programs_are_those_that_are_started() -> None:
+    cells = " ".join(row[0] for row in rows("program | called | has to"))
+    paths = set(re.findall(r"`(/[\w/]+)", cells))
+    started = {path for file in (TREE / "methods").rglob("*.cpp")
+               for path in re.findall(r'"(/(?:usr/)?(?:s?bin|lib)/[\w/]+)"', file.read_text())}
+
+    assert paths | {"/usr/sbin/smartctl", "/usr/sbin/ethtool"} == started
+    assert "`smartctl`, `ethtool`" in cells
