@@ -11,7 +11,7 @@ from pathlib import Path
 
 # The files that each ring leaves, by pattern; what is counted together stands in one row.
 RUNS = {
-    "source": ["source.xml"],
+    "source": ["source.xml", "layers.xml"],
     "unit": ["unit.xml", "unit-sanitizers.xml", "unit-valgrind-*.xml"],
     "bus": ["bus.xml", "bus-policy-file.xml", "bus-kit.xml"],
     "device": ["device.xml"],
