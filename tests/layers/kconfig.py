@@ -18,7 +18,7 @@ REFUSED = "BR2_STATIC_LIBS"
 # Packages of Buildroot, of which this one may select some.
 SELECTED = ("DBUS", "JSON_GLIB", "LIBGLIB2", "LIBUBOOTENV", "LIBXCRYPT", "POLKIT", "ZLIB")
 
-# Buildroot's own helpers, and its meson-package, which is evaluated once every variable is there.
+# What Buildroot itself has, and its meson-package, which is evaluated once every variable is there.
 MAKEFILE = """\
 include {config}
 qstrip = $(strip $(subst ",,$(1)))
