@@ -14,6 +14,7 @@ RUNS = {
     "source": ["source.xml", "layers.xml"],
     "unit": ["unit.xml", "unit-sanitizers.xml", "unit-valgrind-*.xml"],
     "bus": ["bus.xml", "bus-policy-file.xml", "bus-kit.xml"],
+    "packages": ["packages.xml"],
     "device": ["device.xml"],
     "proof": ["proof.xml"],
 }
