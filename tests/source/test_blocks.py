@@ -27,6 +27,9 @@ class Drawing:
 
 
 TRANSCRIPTS = RunBy("tests/bus/test_privanectl_transcripts.py", "def test_transcript(")
+PACKAGES = RunBy("tests/packages/conftest.py", 'TREE / "tools/build_packages"')
+INSTALLS = NotRun(
+    "it changes the machine; tests/packages holds what is installed, asked for, excluded and run then")
 GUIDE = RunBy("tests/bus/test_examples.py", "def test_guide_builds_them(")
 
 # Of each document its blocks, by what they begin with.
@@ -38,6 +41,7 @@ BLOCKS: dict[str, dict[str, RunBy | NotRun | Drawing]] = {
         "./bench": NotRun("it takes minutes; its arithmetic is tested by tests/unit/benchmarks"),
         "$ privanectl group list --no-legend": TRANSCRIPTS,
         " caller ": Drawing(),
+        "tools/build_packages": PACKAGES,
         "meson setup build": NotRun(
             "it changes the machine; tools/build and tests/bus/run do it into folders of their own, "
             "and device/assemble_image lays the result down as an installation would"),
@@ -57,6 +61,13 @@ BLOCKS: dict[str, dict[str, RunBy | NotRun | Drawing]] = {
     "docs/errors.md": {"org.gtk.GDBus.UnmappedGError.": Drawing()},
     "docs/makers.md": {
         "make install ": RunBy("tests/bus/test_example_library.py", "def commands("),
+    },
+    "docs/packages.md": {
+        "tools/build_packages": PACKAGES,
+        "libauthz1-policy-file ": RunBy("tests/packages/test_quality.py",
+                                        "def test_sizes_as_documented("),
+        "dpkg --install privane-system_": INSTALLS,
+        "dpkg --install libauthz1-policy-file_": INSTALLS,
     },
     "docs/privanectl.md": {"$ privanectl group list": TRANSCRIPTS},
     "docs/reliability.md": {

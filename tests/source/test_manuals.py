@@ -6,7 +6,7 @@ import pytest
 
 from conftest import TREE
 
-PAGES = sorted(path for folder in ("client", "check", "service")
+PAGES = sorted(path for folder in ("client", "check", "data", "service")
                for path in (TREE / folder).glob("*.[1-9]"))
 
 # Made by the build, and the manuals of others.
@@ -22,8 +22,9 @@ def references(page: Path) -> set[str]:
             for name, section in REFERENCE.findall(page.read_text())}
 
 
-def test_there_are_three() -> None:
-    assert [page.name for page in PAGES] == ["privane-check.8", "privanectl.1", "privane_system.8"]
+def test_there_are_four() -> None:
+    assert [page.name for page in PAGES] == ["privane-check.8", "privanectl.1",
+                                             "privane-unit-actions.1", "privane_system.8"]
 
 
 @pytest.mark.parametrize("page", PAGES, ids=lambda page: page.name)
