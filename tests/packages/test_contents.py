@@ -18,9 +18,10 @@ LIBRARIES = {
     "librtcclock1": "librtcclock",
 }
 
-EXAMPLES = ("60-privane-operator.rules", "60-privane-units.rules", "60-privane-viewer.rules",
-            "privane-authz-roles.conf", "privane-bus-limits.conf", "privane-own-programs.conf",
-            "privane-roles.conf")
+EXAMPLES = ("60-privane-monitor.rules", "60-privane-operator.rules", "60-privane-time.rules",
+            "60-privane-units.rules", "60-privane-updater.rules", "60-privane-viewer.rules",
+            "60-privane-web.rules", "privane-authz-roles.conf", "privane-bus-limits.conf",
+            "privane-own-programs.conf", "privane-roles.conf")
 HEADERS = ("authz", "bootparam", "digest_entry", "log_backend", "paramcli", "rtc_clock")
 
 CONTENTS = {
@@ -33,6 +34,8 @@ CONTENTS = {
         "/usr/share/dbus-1/system-services/com.zintor.PrivaneSystem.service": FILE,
         "/usr/share/dbus-1/system.d/com.zintor.PrivaneSystem.conf": FILE,
         "/usr/share/doc/privane-system/authorization.md": FILE,
+        "/usr/share/doc/privane-system/com.zintor.PrivaneSystem.html": FILE,
+        "/usr/share/man/man5/com.zintor.PrivaneSystem.5.gz": FILE,
         "/usr/share/man/man8/privane-check.8.gz": FILE,
         "/usr/share/man/man8/privane_system.8.gz": FILE,
         "/usr/share/polkit-1/actions/com.zintor.privane-system.policy": FILE,
