@@ -10,7 +10,7 @@ static constexpr unsigned MARK = 0x50415231;
 static_assert(sizeof(paramcli_options) == 4096, "the size is part of the library's ABI");
 
 static bool is_control(char byte) {
-    return (byte >= '\0' && byte < ' ') || byte == '\x7f';
+    return static_cast<unsigned char>(byte) < ' ' || byte == '\x7f';
 }
 
 static bool is_name(std::string_view name) {

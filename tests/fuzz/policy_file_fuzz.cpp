@@ -91,8 +91,9 @@ static void check_refusal(const GError *error, const std::string &text) {
     hold(std::atoi(number) >= 1 && std::atoi(number) <= lines + 1, "the line is one of the file's",
          message);
     hold(g_utf8_validate(error->message, -1, nullptr) != FALSE, "a refusal is UTF-8", message);
-    hold(message.size() < 400 && std::none_of(message.begin(), message.end(),
-                                              [](char byte) { return byte >= 0 && byte < 32; }),
+    hold(message.size() < 400 &&
+             std::none_of(message.begin(), message.end(),
+                          [](char byte) { return static_cast<unsigned char>(byte) < ' '; }),
          "a refusal is one short line", message);
 }
 

@@ -179,12 +179,17 @@ static bool read_list(const reading &state, const key &known, std::string_view v
         return refuse(state, state.line, "repeated key '%s'", known.name);
     if (list == nullptr)
         return refuse(state, state.line, "empty element in '%s'", known.name);
+    g_autoptr(GHashTable) seen = g_hash_table_new(g_str_hash, g_str_equal);
     for (char **element = list; *element != nullptr; element++) {
         if (**element == '\0')
             return refuse(state, state.line, "empty element in '%s'", known.name);
         if (!known.is_element(*element)) {
             g_autofree char *quoted = quote(*element);
             return refuse(state, state.line, "'%s' is no %s", quoted, known.element);
+        }
+        if (g_hash_table_add(seen, *element) == FALSE) {
+            g_autofree char *quoted = quote(*element);
+            return refuse(state, state.line, "repeated element '%s'", quoted);
         }
     }
     state.role->*known.list = g_steal_pointer(&list);

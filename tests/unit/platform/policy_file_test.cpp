@@ -72,6 +72,9 @@ TEST(PolicyFile, RepetitionIsRefused) {
     EXPECT_EQ(parse("[role a]\ngroups=u\nusers=v\ngroups=u\n"),
               refusal("4: repeated key 'groups'"));
     EXPECT_EQ(parse("[role a]\nactions=x.y\nactions=x.y\n"), refusal("3: repeated key 'actions'"));
+    EXPECT_EQ(parse("[role a]\nusers=u;v;u\n"), refusal("2: repeated element 'u'"));
+    EXPECT_EQ(parse("[role a]\ngroups=u;u\n"), refusal("2: repeated element 'u'"));
+    EXPECT_EQ(parse("[role a]\nactions=x.y;x.*;x.y\n"), refusal("2: repeated element 'x.y'"));
 }
 
 TEST(PolicyFile, EmptyElementIsRefused) {
