@@ -27,6 +27,7 @@ struct intake {
     GHashTable *shares;             // by the sender's name; only of those who hold something
     GHashTable *unanswered;         // the places whose answer has not gone out
     guint calls;
+    guint large_calls;
     gsize cost;
     guint refusals;
 };
@@ -107,12 +108,37 @@ static void forget_empty_share(intake *self, const char *sender, const sender_sh
         (void)g_hash_table_remove(self->shares, sender);
 }
 
+static gboolean trim(void *) {
+    (void)malloc_trim(0);  // Where there was nothing to give back, all is well.
+    return G_SOURCE_REMOVE;
+}
+
+// Of the main loop, whose turn comes however many large calls end meanwhile, and comes once for all
+// of them.
+static gint trim_waits;
+
+static gboolean trim_in_turn(void *) {
+    g_atomic_int_set(&trim_waits, 0);
+    return trim(nullptr);
+}
+
+static void trim_when_freed() {
+    if (g_atomic_int_compare_and_exchange(&trim_waits, 0, 1) != FALSE)
+        (void)g_idle_add_full(G_PRIORITY_DEFAULT, trim_in_turn, nullptr, nullptr);
+}
+
+static bool is_large(gsize cost) {
+    return cost > INTAKE_SMALL_COST;
+}
+
 static void let_go(intake *self, place *held) {
     sender_share *share = share_of(self, held->sender);
     share->calls--;
     share->cost -= held->cost;
     self->calls--;
     self->cost -= held->cost;
+    if (is_large(held->cost) && --self->large_calls == 0)
+        trim_when_freed();
     forget_empty_share(self, held->sender, share);
     place_free(held);
 }
@@ -181,6 +207,8 @@ static place *take_place(intake *self, GDBusMessage *call, const char *sender, g
     share->cost += cost;
     self->calls++;
     self->cost += cost;
+    if (is_large(cost))
+        self->large_calls++;
 
     auto *held = g_new0(place, 1);
     held->sender = g_strdup(sender);
@@ -251,11 +279,6 @@ static void refuse(intake *self, GDBusConnection *connection, GDBusMessage *call
     // It fails only when the connection is closed, and the service with it.
     (void)g_dbus_connection_send_message(connection, answer, G_DBUS_SEND_MESSAGE_FLAGS_NONE,
                                          nullptr, nullptr);
-}
-
-static gboolean trim(void *) {
-    (void)malloc_trim(0);  // Where there was nothing to give back, all is well.
-    return G_SOURCE_REMOVE;
 }
 
 // Freed in small pieces, a large message would stay with the allocator. This thread is done with

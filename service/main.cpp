@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <cstdlib>
 
+#include <malloc.h>
 #include <sys/prctl.h>
 #include <unistd.h>
 
@@ -28,6 +29,13 @@ static constexpr const char *RTC_DEVICE = "/dev/rtc";
 // Only for failures at start-up and shutdown; the log back-end shows it as an error. No enumerator
 // has this value, and it lies outside the range that a static_cast may produce.
 static constexpr auto LOG_LEVEL_FATAL = std::bit_cast<GLogLevelFlags>(1 << G_LOG_LEVEL_USER_SHIFT);
+
+// Freed memory that stays at the end of a heap, and the size from which on a block has pages of its
+// own, which go back when it is freed. By itself glibc raises both with the largest block that was
+// ever freed, to 64 and 32 MiB: a thread's heap would keep what one large message took, since
+// malloc_trim(3) does not shorten it.
+static constexpr int HEAP_END_KEPT = 4 * 1024 * 1024;
+static constexpr int OWN_PAGES_FROM = 4 * 1024 * 1024;
 
 static void on_bus_acquired(GDBusConnection *connection, const char *, gpointer user_data) {
     auto *state = static_cast<ServiceState *>(user_data);
@@ -113,6 +121,9 @@ int main(int argc, char **argv) {
     // The memory holds passwords. A limit of 0 on core files does not hold for programs that take
     // them from the kernel through a pipe.
     (void)prctl(PR_SET_DUMPABLE, 0);  // fails for other values only
+    // It accepts both, mallopt(3).
+    (void)mallopt(M_TRIM_THRESHOLD, HEAP_END_KEPT);
+    (void)mallopt(M_MMAP_THRESHOLD, OWN_PAGES_FROM);
     // Inherited as ignored, every tool that the service runs would seem to succeed.
     (void)signal(SIGCHLD, SIG_DFL);
 

@@ -1,16 +1,19 @@
 """tests/bus/test_intake.py: what the service lets in while it is busy, and what never."""
 import os
+from contextlib import contextmanager
 from pathlib import Path
 from typing import Callable, Iterator
 
 import pytest
 from gi.repository import Gio, GLib
 
+from harness import packaged
 from harness.bus import INTERFACE, NAME, PATH, Bus, BusError, domain_error, error_of
 from harness.deadline import wait_for
 from harness.device import LLDPCLI, Device
 from harness.fake_authz import FakeAuthz
 from harness.interface import ACTION_PREFIX, QUERIES
+from harness.process import status
 from harness.service import Service
 from harness.stage import Stage
 from harness.wire import Wire
@@ -24,6 +27,10 @@ CALL_COST = 4 << 20
 SENDER_CALLS = 16
 SHARED_CALLS = 64
 
+# Of these a call holds not much less than it may.
+LONG_LIST = 29_000
+KEPT_KIB = 5 * 1024
+
 # The longest line of a web user, and how many there may be.
 DIGEST_LINE = "{:0>14}:PRIVANE:" + "0" * 32 + "\n"
 WEB_USERS = 59_001
@@ -31,9 +38,9 @@ WEB_USERS = 59_001
 OPENED = Path("/tmp/opened")
 
 
-@pytest.fixture
-def busy(system: Stage, device: Device) -> Iterator[Callable[[], None]]:
-    """A service whose main loop is held up by a tool, until the function is called."""
+@contextmanager
+def held_up(system: Stage, device: Device) -> Iterator[Callable[[], None]]:
+    """The main loop is held up by a tool, until the function is called."""
     device.tools[LLDPCLI].before_answering(f"while [ ! -e {OPENED} ]; do sleep 0.01; done")
     system.wire.send("ExecuteLldpcli", "s", "show-neighbors")
     wait_for("the tool", lambda: (device.tools[LLDPCLI].directory / "descriptors").exists())
@@ -42,6 +49,12 @@ def busy(system: Stage, device: Device) -> Iterator[Callable[[], None]]:
     # The service has come to the end of the tool.
     assert system.bus.call("CheckUser", "s", "root") == (True,)
     OPENED.unlink()
+
+
+@pytest.fixture
+def busy(system: Stage, device: Device) -> Iterator[Callable[[], None]]:
+    with held_up(system, device) as let_go:
+        yield let_go
 
 
 @pytest.fixture
@@ -115,6 +128,27 @@ def test_a_digest_list_of_all_users_is_taken(system: Stage) -> None:
     assert system.bus.call("Digest", "as", ["create", users], timeout=30) == ()
     (call,) = system.digest.calls()
     assert call.words[1] == users
+
+
+def resident(service: Service) -> int:
+    """In KiB."""
+    return int(status(service.pid)["VmRSS"].split()[0])
+
+
+def test_memory_of_large_calls_is_given_back(system: Stage, device: Device,
+                                             wires: Callable[[int], list[Wire]]) -> None:
+    system.stop()
+    system.start(**packaged.environment())
+    callers = wires(SHARED_CALLS // SENDER_CALLS)
+    at_rest = resident(system.service)
+    with held_up(system, device) as let_go:
+        calls = [(wire, wire.send("ModifyUser", "sssasss", "root", "", "", ["nosuch"] * LONG_LIST,
+                                  "", "")) for wire in callers]
+        wait_for("their arrival", lambda: resident(system.service) > at_rest + 2 * KEPT_KIB)
+        let_go()
+        for wire, serial in calls:
+            assert answers(wire, 1).keys() == {serial}
+    wait_for("the memory", lambda: resident(system.service) <= at_rest + KEPT_KIB)
 
 
 def test_a_long_list_is_refused(service: Service, bus: Bus) -> None:

@@ -6,8 +6,8 @@ LARGEST is the most that the bus takes in a message; it throws out who sends mor
 Prints a line when its connections stand, waits for a line, then floods until its standard input
 ends, and prints as JSON what came of it: the "messages" it began to send, those that the service
 "answered" and those that the bus "denied", those "stalled" in the bus, and how often it was
-"thrown_out". It writes prebuilt bytes to raw sockets. Most kinds read nothing until the end, and then no more than it takes to see
-that they arrived: whoever means harm does not wait for answers.
+"thrown_out". It writes prebuilt bytes to raw sockets. Most kinds read nothing until the end, and
+then no more than it takes to see that they arrived: whoever means harm does not wait for answers.
 """
 import array
 import errno
@@ -25,8 +25,11 @@ from typing import Callable
 from gi.repository import Gio, GLib
 
 from harness.bus import ACCESS_DENIED, INTERFACE, NAME, PATH
+from harness.flood_messages import (BODY_LENGTH_OFFSET, HEAD, TEXT_SIZE, VARIANT, call,
+                                    large_answer, large_signal, largest_list, list_call, silent,
+                                    text_call)
 from harness.sandbox import SYSTEM_BUS
-from harness.wire import FIXED_HEADER, NO_CAPABILITIES
+from harness.wire import FIXED_HEADER
 
 CONNECTIONS = 8
 # Fewer where more would be under way at once: with many, hardly a message would get through.
@@ -35,19 +38,12 @@ STALLED_CONNECTIONS = 40
 MEBIBYTE = 1 << 20
 # More than the kernel keeps of what is sent and not read.
 SOCKET = MEBIBYTE // 4
-# Of a message without its arguments, at most.
-HEAD = 1024
 LARGE = 16 * MEBIBYTE
-# Of an empty text in a list: its length, its terminator, and padding.
-TEXT_SIZE = 8
-# Of a byte as a variant in a list: the length and the text of its type, and itself.
-VARIANT = b"\x01y\x00\x07"
-# Of a message: where its type, its flags, the length of its body and its number stand.
+# Of a message: where its type and its number stand.
 TYPE_OFFSET = 1
-FLAGS_OFFSET = 2
-BODY_LENGTH_OFFSET = 4
 SERIAL_OFFSET = 8
-NO_REPLY_EXPECTED = 1
+# That of the hello.
+FIRST_SERIAL = 1
 ANSWERS = {Gio.DBusMessageType.METHOD_RETURN, Gio.DBusMessageType.ERROR}
 # The header's field for the sender, of what the bus itself says.
 FROM_BUS = b"\x07\x01s\0\x14\0\0\0org.freedesktop.DBus\0"
@@ -79,10 +75,14 @@ class Connection:
                                                 path="/org/freedesktop/DBus",
                                                 interface="org.freedesktop.DBus"))
         assert self.socket.recv(1, socket.MSG_PEEK)
-        self.serial = 1
+        self.serial = FIRST_SERIAL
         self.socket.setblocking(False)
         self.rest = memoryview(b"")
         self.unread = bytearray()
+
+    @property
+    def is_used(self) -> bool:
+        return self.serial > FIRST_SERIAL
 
     def number(self, blob: bytes) -> bytearray:
         """The message with the connection's next number."""
@@ -141,51 +141,6 @@ def finished(seconds: float = 0) -> bool:
     return bool(select.select([sys.stdin], [], [], seconds)[0])
 
 
-def blob_of(message: Gio.DBusMessage, body: GLib.Variant | None) -> bytes:
-    message.set_serial(1)
-    if body is not None:
-        message.set_body(body)
-    return message.to_blob(NO_CAPABILITIES)
-
-
-def call(member: str, body: GLib.Variant | None, destination: str = NAME, path: str = PATH,
-         interface: str = INTERFACE) -> bytes:
-    return blob_of(Gio.DBusMessage.new_method_call(destination, path, interface, member), body)
-
-
-def silent(blob: bytes) -> bytes:
-    """The call, to be left unanswered. The bus lets a caller wait for few answers at a time, and
-    leave any number of calls unanswered."""
-    changed = bytearray(blob)
-    changed[FLAGS_OFFSET] |= NO_REPLY_EXPECTED
-    return bytes(changed)
-
-
-def text_call(size: int) -> bytes:
-    return call("GetUser", GLib.Variant("(s)", ("x" * size,)))
-
-
-def list_call(elements: int) -> bytes:
-    return call("Pinsrv", GLib.Variant("(as)", ([""] * elements,)))
-
-
-def addressed(message: Gio.DBusMessage, size: int) -> bytes:
-    message.set_destination(NAME)
-    return blob_of(message, GLib.Variant("(s)", ("x" * size,)))
-
-
-def large_signal(size: int) -> bytes:
-    return addressed(Gio.DBusMessage.new_signal(PATH, INTERFACE, "UserDatabaseUpdated"), size)
-
-
-def large_answer(size: int) -> bytes:
-    """A reply to nothing."""
-    message = Gio.DBusMessage()
-    message.set_message_type(Gio.DBusMessageType.METHOD_RETURN)
-    message.set_reply_serial(7)
-    return addressed(message, size)
-
-
 def hear_out(connections: list[Connection], least: int) -> None:
     """Sends nothing more and waits for answers."""
     end = time.monotonic() + HEARING_SECONDS
@@ -198,17 +153,18 @@ def hear_out(connections: list[Connection], least: int) -> None:
 
 
 def flood_with(blobs: list[bytes], chance: random.Random, is_reading: bool = False) -> None:
-    """As fast as the bus takes it, on all connections in turn."""
+    """As fast as the bus takes it, on all connections in turn: on each the first blob first, and at
+    least one message whole."""
     largest = max(map(len, blobs))
     connections = [Connection() for _ in range(min(CONNECTIONS, UNDER_WAY // largest + 1))]
     start()
-    while not finished():
+    while not finished() or all(connection.rest for connection in connections):
         _, writable, _ = select.select([], connections_of(connections), [], 0.05)
         for connection in connections:
             if connection.socket not in writable:
                 continue
             for _ in range(16):
-                if not connection.push(chance.choice(blobs)):
+                if not connection.push(chance.choice(blobs) if connection.is_used else blobs[0]):
                     break
                 done["messages"] += 1
             while is_reading and connection.hear():
@@ -283,16 +239,7 @@ def lists(chance: random.Random, largest: int) -> None:
     """Lists that just fit, and larger ones."""
     fitting = list_call(30_000)
     larger = list_call(min(250_000, large(largest) // TEXT_SIZE))
-    flood_with([silent(fitting), silent(fitting), fitting, larger], chance)
-
-
-def largest_list(kind: str, elements: bytes) -> bytes:
-    """A call with one list of that kind of elements."""
-    head = bytearray(call("Pinsrv", GLib.Variant(f"({kind})", ([],))))
-    body = struct.pack("<I", len(elements)) + elements
-    struct.pack_into("<I", head, BODY_LENGTH_OFFSET, len(body))
-    # Without the length of the empty list.
-    return bytes(head[:-4]) + body
+    flood_with([fitting, silent(fitting), silent(fitting), larger], chance)
 
 
 def flood_with_largest_lists(blob: bytes, chance: random.Random) -> None:
@@ -339,20 +286,22 @@ def descriptors(chance: random.Random, _: int) -> None:
 
 
 def stalled(_: random.Random, largest: int) -> None:
-    """Messages that begin and never end, while their connections stay."""
+    """Messages that begin and never end, while their connections stay; at least one of them is under
+    way in the bus."""
     connections = [Connection() for _ in range(STALLED_CONNECTIONS)]
     start()
     blob = text_call(large(largest))[:-1]
     for connection in connections:
         connection.push(blob)
         done["messages"] += 1
-    while not finished(0.01):
+    # More than a socket holds: the bus has read of it.
+    while not finished(0.01) or all(len(connection.rest) >= len(blob) - SOCKET
+                                    for connection in connections):
         for connection in connections:
             if connection.rest:
                 connection.push(b"")
     for connection in connections:
         connection.hear()
-        # More than a socket holds: the bus has read of it.
         done["stalled"] += len(connection.rest) < len(blob) - SOCKET
 
 
