@@ -21,6 +21,8 @@ STARTS = list(dict.fromkeys(defect.noticed_by for defect in DEFECTS))
 
 # Where a start names tests, the rest of its proof's units are those of other tests.
 TABLES, TABLES_COLUMNS = ("authorization_matrix", "policy_matrix"), 8
+# Whatever is selected of these goes on for the whole amount.
+FLOODS = {"flood", "flood_limited"}
 
 
 def columns(start: Start) -> int:
@@ -34,11 +36,11 @@ def columns(start: Start) -> int:
     assert option == "-k"
     return sum(wanted in name for name in names)
 
-
 def reach(start: Start) -> int:
     """The units that a start does."""
     if start.proof not in TABLES:
-        assert "-k" not in start.words, "of that proof nobody knows how much a test does"
+        assert start.proof in FLOODS or "-k" not in start.words, \
+            "of that proof nobody knows how much a test does"
         return start.amount
     [table] = proofs.of_gate([start.proof])
     return columns(start) * table.gate // TABLES_COLUMNS

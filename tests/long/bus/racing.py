@@ -14,7 +14,7 @@ from harness.accounts import CLERK_UID
 from harness.bus import INTERFACE, NAME, PATH, Bus
 from harness.deadline import wait_for
 from harness.interface import METHODS, QUERIES
-from harness.monitor import BUS, CALL, PATIENCE, Record
+from harness.monitor import BUS, CALL, ERROR, PATIENCE, RETURN, Record, Seen
 from harness.sandbox import PYTHON, SYSTEM_BUS
 from harness.service import Service
 from harness.wire import NO_CAPABILITIES
@@ -95,6 +95,7 @@ class Races:
     def __init__(self, bus: Bus, service: Service, record: Record) -> None:
         self._bus, self._service, self._record = bus, service, record
         self._mark = record.mark()
+        self._owner = bus.owner()
         self._connections = self._held()
         self.counts: Counter[str] = Counter()
 
@@ -118,7 +119,7 @@ class Races:
 
     def _settle(self) -> None:
         """Until the bus has let each of the connections go, and so passed on what they sent; then
-        until the service has told of every call that reached it."""
+        until the service has answered every call that reached it, with whatever."""
         Pipeline().close()  # those that were made earlier the bus accepted earlier
         wait_for("the end of the connections", lambda: self._held() == self._connections, PATIENCE)
         self._record.catch_up(self._bus)
@@ -137,7 +138,8 @@ class Races:
     def _is_answered(self, arrived: int) -> bool:
         assert self._service.is_running(), self._service.output()[-3:]
         assert self._bus.call("CheckUser", "s", "root", timeout=PATIENCE) == (True,)
-        return len(self.told()) >= arrived
+        self._record.catch_up(self._bus)
+        return len(self._answers()) >= arrived
 
     def told(self) -> list[str]:
         """The refusals that the service logged."""
@@ -145,7 +147,17 @@ class Races:
 
     def calls(self) -> list[str]:
         """The members called by others than this process's own connections."""
-        seen_calls = [seen for seen in self._record.since(self._mark)
-                      if seen.type == CALL and seen.destination == NAME]
-        root = {seen.sender for seen in seen_calls if seen.member == "CheckUser"}
-        return [str(seen.member) for seen in seen_calls if seen.sender not in root]
+        return [str(seen.member) for seen in self._of_racers()]
+
+    def _of_racers(self) -> list[Seen]:
+        calls = [seen for seen in self._record.since(self._mark)
+                 if seen.type == CALL and seen.destination == NAME]
+        root = {seen.sender for seen in calls if seen.member == "CheckUser"}
+        return [seen for seen in calls if seen.sender not in root]
+
+    def _answers(self) -> list[Seen]:
+        """What the service sent to those that called, gone as they are."""
+        callers = {seen.sender for seen in self._of_racers()}
+        return [seen for seen in self._record.since(self._mark)
+                if seen.type in (RETURN, ERROR) and seen.sender == self._owner
+                and seen.destination in callers]

@@ -198,7 +198,7 @@ TEST_F(CallTrap, KnownCallsAreMadeAndRecorded) {
         {"truncate file", [] { return static_cast<long>(ftruncate(open_file("file"), 4)); }    },
         {"rename file",   [] { return static_cast<long>(rename("file", "new")); }              },
         {"unlink new",    [] { return static_cast<long>(unlink("new")); }                      },
-        {"rmdir empty",   [] { return syscall(SYS_rmdir, "empty"); }                           },
+        {"rmdir empty",   [] { return static_cast<long>(rmdir("empty")); }                     },
         {"mkdir empty",   [] { return static_cast<long>(mkdirat(AT_FDCWD, "empty", 0700)); }   },
         {"chown other",
          [] { return static_cast<long>(fchownat(AT_FDCWD, "other", geteuid(), getegid(), 0)); }},
