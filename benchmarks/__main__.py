@@ -1,8 +1,9 @@
 """benchmarks/__main__.py: runs the measurements in the sandbox that ./bench has made.
 
-    python3 -m benchmarks BUILD RESULTS DISK_FOLDER [quick] [NAME...]
+    python3 -m benchmarks BUILD RESULTS DISK_FOLDER COMMIT [quick] [NAME...]
 
-Without names of measurements all are run, and their figures are left in the file RESULTS.
+COMMIT is told below the table. Without names of measurements all are run, and their figures are left in
+the file RESULTS.
 Exit status: 0 when no goal is missed by more than its slack.
 """
 import datetime
@@ -74,9 +75,10 @@ def measure(context: Context, results: Results, names: list[str]) -> None:
         print(f"  {measurement.__name__}: {time.monotonic() - started:.0f} s"
               f"{', failed: ' + reason if missing else ''}", flush=True)
     results.processor = {name: list(spent) for name, spent in context.processor.items()}
+    results.floors = context.floors
 
 
-def main(build: Path, results_file: Path, disk: Path, words: list[str]) -> int:
+def main(build: Path, results_file: Path, disk: Path, commit: str, words: list[str]) -> int:
     require_sandbox()
     quick = "quick" in words
     names = [word for word in words if word != "quick"]
@@ -85,15 +87,15 @@ def main(build: Path, results_file: Path, disk: Path, words: list[str]) -> int:
     memory, mounted = Path("/tmp/worlds"), Path("/tmp/ext4")
     memory.mkdir()
     worlds.mount_ext4(disk / "ext4.img", mounted)
-    results = Results(command="./bench quick" if quick else "./bench",
+    results = Results(command="./bench quick" if quick else "./bench", commit=commit,
                       date=datetime.date.today().isoformat(),
                       machine=f"{platform.machine()}, {os.cpu_count()} cores, Linux {platform.release()}")
     try:
-        context = Context(Machine(build, Gio.bus_get_sync(Gio.BusType.SYSTEM, None)),
-                          QUICK if quick else FULL, memory, mounted,
-                          started + BUDGET_SECONDS["quick" if quick else "full"])
+        machine = Machine(build, Gio.bus_get_sync(Gio.BusType.SYSTEM, None))
         time.sleep(0.5)  # polkitd takes up the rule
-        with cfgstore(memory):
+        with cfgstore(machine.program("cfgstore"), memory) as counting:
+            context = Context(machine, counting, QUICK if quick else FULL, memory, mounted,
+                              started + BUDGET_SECONDS["quick" if quick else "full"])
             measure(context, results, names)
     finally:
         subprocess.run(["umount", mounted], check=True)
@@ -105,4 +107,5 @@ def main(build: Path, results_file: Path, disk: Path, words: list[str]) -> int:
 
 
 if __name__ == "__main__":
-    sys.exit(main(Path(sys.argv[1]), Path(sys.argv[2]), Path(sys.argv[3]), sys.argv[4:]))
+    sys.exit(main(Path(sys.argv[1]), Path(sys.argv[2]), Path(sys.argv[3]), sys.argv[4],
+                  sys.argv[5:]))

@@ -65,11 +65,29 @@ def differences(whole: Sequence[float], part: Sequence[float]) -> list[float]:
     return left
 
 
+def not_below(values: Sequence[float], least: float) -> list[float]:
+    """The values, of which a smaller one would tell that nothing has happened."""
+    if any(value < least for value in values):
+        raise ValueError(f"{min(values):g} is less than the least that it takes, {least:g}")
+    return list(values)
+
+
 def growth_exponents(small: Sequence[float], large: Sequence[float], factor: float) -> list[float]:
     """The e of each round for which the time grew by factor to the power of e: 1 is linear."""
     if factor <= 1:
         raise ValueError(f"no growth: {factor}")
     return [math.log(ratio) / math.log(factor) for ratio in ratios(large, small)]
+
+
+def shares(total: int, weights: Sequence[int]) -> list[int]:
+    """How many of a total each weight gets: together exactly the total, and none gets nothing."""
+    if not weights or min(weights) <= 0:
+        raise ValueError(f"no weights: {weights}")
+    borders = [total * sum(weights[:end]) // sum(weights) for end in range(len(weights) + 1)]
+    counts = [end - start for start, end in zip(borders, borders[1:])]
+    if min(counts) <= 0:
+        raise ValueError(f"{total} are too few for {weights}")
+    return counts
 
 
 def judge(value: float | None, bound: Bound, goal: float, stretch: float | None,

@@ -26,6 +26,7 @@ STOCK_NAME = "org.freedesktop.Accounts"
 
 SANDBOX_STATE = Path("/run/bus-sandbox")
 PATIENCE_SECONDS = 60
+SIGNAL_SECONDS = 5
 VISIT_SECONDS = 300
 
 
@@ -143,14 +144,12 @@ class Machine:
     def service(self, world: World, authz: str = "polkit"):
         return self.daemon(world.command(SERVICE, "-n"), self.service_environment(authz), BUS_NAME)
 
-    def reference(self, world: World, authz: str | None = None, names: Path | None = None):
-        """With or without a check of each caller; in the service's environment."""
+    def reference(self, world: World, checks: str = "none", names: Path | None = None):
+        """Each call is allowed ("none") or checked ("polkit"); in the service's environment."""
         self._names += 1
         name = f"com.zintor.PrivaneBench.r{self._names}"
-        environment = self.service_environment(authz or "polkit")
-        command = [self.program("reference"), name, "authz" if authz else "none",
-                   *([names] if names else [])]
-        return self.daemon(world.command(*command), environment, name)
+        command = [self.program("reference"), name, checks, *([names] if names else [])]
+        return self.daemon(world.command(*command), unit_environment(SERVICE_UNIT), name)
 
     def minimal_command(self) -> tuple[list[str], str]:
         """The minimal daemon, and the name that it takes."""
@@ -176,13 +175,13 @@ class Machine:
             os.kill(pid, 0)
 
     def call_times(self, daemon: Daemon, method: str, arguments: str, *, calls: int, warm_up: int = 5,
-                   callers: int = 1, uid: int = 0, fails: bool = False, show: bool = False,
+                   callers: int = 1, uid: int = 0, fails_with: str | None = None, show: bool = False,
                    after: tuple[str, str] | None = None, path: str = OBJECT_PATH) -> str:
-        """Runs the client; what it printed."""
+        """Runs the client; what it printed. Each call must succeed, or fail with the text."""
         full_name = method if "." in method else f"{BUS_NAME}.{method}"
         command = [self.program("call_times"), f"--destination={daemon.unique_name}", f"--path={path}",
                    f"--calls={calls}", f"--warm-up={warm_up}", f"--callers={callers}"]
-        command += ["--fails"] * fails + ["--show"] * show
+        command += [f"--fails-with={fails_with}"] * (fails_with is not None) + ["--show"] * show
         if after is not None:
             command += [f"--after={BUS_NAME}.{after[0]}", f"--after-arguments={after[1]}"]
         identity = {"user": uid, "group": 65534, "extra_groups": [privane_gid()]} if uid else {}
@@ -224,18 +223,39 @@ def run(command: list, **options) -> str:
     return done.stdout
 
 
+class Cfgstore:
+    """The process of that name, to which every change of an account sends a signal."""
+
+    def __init__(self, count_file: Path) -> None:
+        self._count_file = count_file
+
+    def signals(self) -> int:
+        """How many have come since it runs."""
+        return int(self._count_file.read_text())
+
+    def require_signals(self, expected: int) -> None:
+        """The last may still be on its way."""
+        deadline = time.monotonic() + SIGNAL_SECONDS
+        while self.signals() < expected and time.monotonic() < deadline:
+            time.sleep(0.002)
+        if self.signals() != expected:
+            raise RuntimeError(f"cfgstore got {self.signals()} signals in all, and not {expected}")
+
+
 @contextmanager
-def cfgstore(folder: Path) -> Iterator[None]:
-    """A process of that name, which every change of an account sends a signal to."""
-    program = folder / "cfgstore"
-    program.write_bytes(Path("/bin/sleep").read_bytes())
-    program.chmod(0o755)
+def cfgstore(program: Path, folder: Path) -> Iterator[Cfgstore]:
+    """Runs it."""
+    count_file = folder / "cfgstore-signals"
     with ExitStack() as stack:
-        process = subprocess.Popen([program, "infinity"], stdin=subprocess.DEVNULL,
-                                   preexec_fn=lambda: signal.signal(signal.SIGUSR1, signal.SIG_IGN))
+        process = subprocess.Popen([program, count_file], stdin=subprocess.DEVNULL)
         stack.callback(process.wait)
         stack.callback(process.kill)
-        yield
+        deadline = time.monotonic() + PATIENCE_SECONDS
+        while not count_file.exists() or not count_file.read_text():
+            if process.poll() is not None or time.monotonic() > deadline:
+                raise RuntimeError("cfgstore does not count")
+            time.sleep(0.005)
+        yield Cfgstore(count_file)
         if process.poll() is not None:
             raise RuntimeError("cfgstore has ended")
 

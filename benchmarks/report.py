@@ -20,11 +20,14 @@ class Results:
     """A run: the figures of each goal by its number, a value a round, or why there are none."""
 
     command: str
+    commit: str
     date: str
     machine: str
     figures: dict[str, list[float]] = field(default_factory=dict)
     reasons: dict[str, str] = field(default_factory=dict)
     processor: dict[str, list[float]] = field(default_factory=dict)
+    # What the floor reaches in the place of the service, by the number of the goal.
+    floors: dict[str, list[float]] = field(default_factory=dict)
     seconds: float = 0
 
     def save(self, file: Path) -> None:
@@ -43,17 +46,22 @@ class Row:
     reason: str
 
 
+def row_of(goal: Goal, values: list[float] | None, reason: str) -> Row:
+    measured = spread(values) if values else None
+    verdict = judge(measured.median if measured else None, goal.bound, goal.goal, goal.stretch, goal.slack)
+    return Row(goal, measured, verdict, "" if measured else reason)
+
+
 def rows_of(results: Results) -> list[Row]:
     """One for every goal, whatever was measured."""
-    rows = []
-    for goal in GOALS:
-        values = results.figures.get(goal.number)
-        measured = spread(values) if values else None
-        verdict = judge(measured.median if measured else None, goal.bound, goal.goal, goal.stretch,
-                        goal.slack)
-        reason = "" if measured else results.reasons.get(goal.number, "its measurement has not run")
-        rows.append(Row(goal, measured, verdict, reason))
-    return rows
+    return [row_of(goal, results.figures.get(goal.number),
+                   results.reasons.get(goal.number, "its measurement has not run")) for goal in GOALS]
+
+
+def floor_rows_of(results: Results) -> list[Row]:
+    """How the goal would be judged if the floor stood in the service's place; no verdict of the run."""
+    return [row_of(goal, results.floors[goal.number], "") for goal in GOALS
+            if goal.number in results.floors]
 
 
 def status_of(results: Results) -> int:
@@ -87,6 +95,9 @@ def terminal_lines(results: Results) -> list[str]:
         lines.append(f"{verdict:7} {goal.number:4} {measured_text(row):26} "
                      f"{goal_text(goal, goal.goal):8} {goal.what}{over}: {row.verdict.value}"
                      f"{': ' + row.reason if row.reason else ''}")
+    for row in floor_rows_of(results):
+        lines.append(f"the floor in the place of the service, {row.goal.number}: {measured_text(row)}, "
+                     f"{goal_text(row.goal, row.goal.goal)}: {row.verdict.value}")
     for name, spent in results.processor.items():
         lines.append(f"processor time a GetUser, {name}: service {spent[0]:.0f} us, bus {spent[1]:.0f} us, "
                      f"polkitd {spent[2]:.0f} us")
@@ -96,8 +107,7 @@ def terminal_lines(results: Results) -> list[str]:
 
 
 def markdown(results: Results) -> str:
-    lines = [f"`{results.command}`, {results.date}, {results.machine}, {results.seconds:.0f} s.", "",
-             "| # | what | over | measured (rounds from, to) | goal | stretch | verdict |",
+    lines = ["| # | what | over | measured (rounds from, to) | goal | stretch | verdict |",
              "|---|---|---|---|---|---|---|"]
     for row in rows_of(results):
         goal = row.goal
@@ -105,6 +115,14 @@ def markdown(results: Results) -> str:
         cells = (goal.number, goal.what, "" if goal.over == "nothing" else goal.over, measured_text(row),
                  goal_text(goal, goal.goal), goal_text(goal, goal.stretch), verdict)
         lines.append("| " + " | ".join(cell.replace("|", "/").replace("\n", " ") for cell in cells) + " |")
+    lines += ["", f"`{results.command}` of {results.commit}, {results.date}, {results.machine}, "
+              f"{results.seconds:.0f} s."]
+    lines += ["", "What the floor itself reaches against the same tool, in the same rounds (no goal):", "",
+              "| # | what | over | measured (rounds from, to) | goal | verdict if it were the service |",
+              "|---|---|---|---|---|---|"]
+    lines += [f"| {row.goal.number} | {row.goal.what} | the floor | {measured_text(row)} | "
+              f"{goal_text(row.goal, row.goal.goal)} | {row.verdict.value} |"
+              for row in floor_rows_of(results)]
     lines += ["", "Processor time of one GetUser, microseconds (of that machine; no goal):", "",
               "| candidate | daemon | bus | polkitd |", "|---|---|---|---|"]
     lines += [f"| {name} | {spent[0]:.0f} | {spent[1]:.0f} | {spent[2]:.0f} |"

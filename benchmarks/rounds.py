@@ -16,14 +16,16 @@ class Amounts:
     stock_changes: int
     large_changes: int
     starts: int
+    stock_starts: int
+    list_calls: int  # of the longest lists
     mixed_calls: int
     pairs: int
 
 
-FULL = Amounts(rounds=7, calls=600, slow_calls=150, changes=12, stock_changes=4, large_changes=2,
-               starts=5, mixed_calls=20_000, pairs=500)
+FULL = Amounts(rounds=7, calls=1500, slow_calls=400, changes=12, stock_changes=4, large_changes=2,
+               starts=11, stock_starts=3, list_calls=30, mixed_calls=20_000, pairs=500)
 QUICK = Amounts(rounds=3, calls=200, slow_calls=40, changes=4, stock_changes=2, large_changes=1,
-                starts=3, mixed_calls=2_000, pairs=50)
+                starts=3, stock_starts=1, list_calls=8, mixed_calls=2_000, pairs=50)
 
 
 def interleave(candidates: dict[str, Visit], rounds: int,

@@ -1,11 +1,12 @@
-// benchmarks/floor/chain_floor.cpp: what adding an account costs at the very least: the hash, the
-// three account files and the digest file replaced in their order with every sync, pidof and its
-// signal, with the C library alone.
+// benchmarks/floor/chain_floor.cpp: what adding or removing an account costs at the very least: the
+// hash, the three account files and the digest file replaced in their order with every sync, pidof
+// and its signal, with the C library alone.
 //
-//   chain_floor hash|files|digest|pidof|chain REPEATS FOLDER
+//   chain_floor hash|pidof|add|remove REPEATS FOLDER
 //
-// FOLDER holds passwd, shadow, group and apache2/digest_auth_passwd, of which it writes other
-// versions. Prints the microseconds that one takes, the median of the repeats.
+// Removing is all of adding but the hash. FOLDER holds passwd, shadow, group and
+// apache2/digest_auth_passwd, of which it writes other versions. Prints the microseconds that one
+// takes, the median of the repeats.
 #include <algorithm>
 #include <cerrno>
 #include <csignal>
@@ -207,35 +208,49 @@ static double now() {
     return static_cast<double>(time.tv_sec) * 1e6 + static_cast<double>(time.tv_nsec) / 1e3;
 }
 
-static void run_once(const char *item, const accounts &all, const std::string &folder) {
-    const bool whole = strcmp(item, "chain") == 0;
-    if (whole || strcmp(item, "hash") == 0)
+// What is measured, and what it consists of.
+struct item {
+    const char *name;
+    bool hash;
+    bool files;
+    bool pidof;
+};
+
+static constexpr item items[] = {
+    {"hash",   true,  false, false},
+    {"pidof",  false, false, true },
+    {"add",    true,  true,  true },
+    {"remove", false, true,  true },
+};
+
+static void run_once(const item &measured, const accounts &all, const std::string &folder) {
+    if (measured.hash)
         hash_password();
-    if (whole || strcmp(item, "files") == 0)
+    if (measured.files) {
         replace_files(all, folder);
-    if (whole || strcmp(item, "digest") == 0)
         replace_digests(folder);
-    if (whole || strcmp(item, "pidof") == 0)
+    }
+    if (measured.pidof)
         signal_cfgstore();
 }
 
 int main(int argc, char **argv) {
-    static constexpr const char *items[] = {"hash", "files", "digest", "pidof", "chain"};
-    bool known = false;
-    for (const char *item : items)
-        known = known || (argc == 4 && strcmp(argv[1], item) == 0);
+    const item *measured = nullptr;
+    for (const item &known : items)
+        if (argc == 4 && strcmp(argv[1], known.name) == 0)
+            measured = &known;
     const int repeats = argc == 4 ? atoi(argv[2]) : 0;
-    if (!known || repeats < 1) {
-        (void)fprintf(stderr, "usage: chain_floor hash|files|digest|pidof|chain REPEATS FOLDER\n");
+    if (measured == nullptr || repeats < 1) {
+        (void)fprintf(stderr, "usage: chain_floor hash|pidof|add|remove REPEATS FOLDER\n");
         return 2;
     }
     const std::string folder = argv[3];
     const accounts all = read_accounts(folder);
-    run_once(argv[1], all, folder);  // a warm-up that does not count
+    run_once(*measured, all, folder);  // a warm-up that does not count
     std::vector<double> times;
     for (int i = 0; i < repeats; i++) {
         const double start = now();
-        run_once(argv[1], all, folder);
+        run_once(*measured, all, folder);
         times.push_back(now() - start);
     }
     const auto middle = times.begin() + repeats / 2;

@@ -4,7 +4,7 @@ import math
 import pytest
 
 from benchmarks.figures import (Bound, Verdict, differences, exit_status, growth_exponents, judge,
-                                ratios, spread, sums)
+                                not_below, ratios, shares, spread, sums)
 from benchmarks.rounds import interleave
 
 AT_MOST, AT_LEAST = Bound.AT_MOST, Bound.AT_LEAST
@@ -45,10 +45,29 @@ def test_parts_are_added_and_taken_off_round_by_round() -> None:
         differences([5.0, 1.0], [1.0, 1.0])
 
 
+def test_what_ended_too_early_is_refused() -> None:
+    assert not_below([0.95, 1.0], 0.95) == [0.95, 1.0]
+    with pytest.raises(ValueError):
+        not_below([1.0, 0.94], 0.95)
+
+
 def test_growth_exponents() -> None:
     assert growth_exponents([3.0, 3.0, 3.0], [3.0, 30.0, 300.0], 10) == pytest.approx([0, 1, 2])
     with pytest.raises(ValueError):
         growth_exponents([1.0], [1.0], 1)
+
+
+def test_shares_are_the_total_together() -> None:
+    assert shares(100, [1, 3]) == [25, 75]
+    assert shares(10, [1, 1, 1]) == [3, 3, 4]
+    for total in (2000, 20_000, 101):
+        assert sum(shares(total, [48, 30, 1, 21])) == total
+
+
+@pytest.mark.parametrize("total, weights", [(10, []), (10, [1, 0]), (10, [1, 30]), (0, [1])])
+def test_a_share_of_nothing_is_refused(total: int, weights: list[int]) -> None:
+    with pytest.raises(ValueError):
+        shares(total, weights)
 
 
 @pytest.mark.parametrize("value, verdict", [

@@ -7,12 +7,12 @@ from benchmarks.__main__ import MEASUREMENTS
 from benchmarks.figures import Bound, Verdict
 from benchmarks.goals import GOALS
 from benchmarks.programs import parsed_answer, unit_environment
-from benchmarks.report import (BEGIN, END, Results, markdown, rows_of, status_of, terminal_lines,
-                               with_table)
+from benchmarks.report import (BEGIN, END, Results, floor_rows_of, markdown, rows_of, status_of,
+                               terminal_lines, with_table)
 
 
 def results_that_meet_all() -> Results:
-    return Results("./bench", "2026-01-02", "a machine",
+    return Results("./bench", "abc1234 and changes", "2026-01-02", "a machine",
                    {goal.number: [float(goal.goal)] for goal in GOALS})
 
 
@@ -56,21 +56,32 @@ def test_each_goal_that_is_missed_or_not_measured_fails_the_run(goal) -> None:
 
 
 def test_an_empty_run_shows_every_goal_as_failed() -> None:
-    empty = Results("./bench", "2026-01-02", "a machine")
+    empty = Results("./bench", "abc1234 and changes", "2026-01-02", "a machine")
     lines = terminal_lines(empty)
     assert sum(line.startswith("failed ") for line in lines) == len(GOALS)
     assert lines[-1] == f"0 goals met, {len(GOALS)} missed, in 0 s"
     assert status_of(empty) == 1
 
 
-def test_the_table_tells_command_date_and_spread() -> None:
+def test_the_table_tells_command_commit_date_and_spread() -> None:
     results = results_that_meet_all()
     results.figures["1"] = [1.2, 1.25, 1.5]
     table = markdown(results)
-    assert table.startswith("`./bench`, 2026-01-02, a machine, 0 s.\n")
+    assert "`./bench` of abc1234 and changes, 2026-01-02, a machine, 0 s." in table.splitlines()
     assert ("| 1 | GetUser, everything allowed | Ping of the same process | 1.25 (1.2 to 1.5) | <= 1.4 | "
             "<= 1.3 | stretch goal met |") in table
     assert sum(line.startswith("| ") and line[2].isdigit() for line in table.splitlines()) == len(GOALS)
+
+
+def test_what_the_floor_reaches_is_told_and_decides_nothing() -> None:
+    results = results_that_meet_all()
+    results.floors = {"12b": [2.0, 2.5, 3.0], "10a": [11.0]}
+    assert [(row.goal.number, row.measured.median, row.verdict) for row in floor_rows_of(results)] == [
+        ("10a", 11.0, Verdict.MET), ("12b", 2.5, Verdict.MISSED)]
+    assert ("| 12b | userdel, 25 users, ext4 | the floor | 2.5 (2 to 3) | >= 3.4 | missed |"
+            in markdown(results).splitlines())
+    assert "the floor in the place of the service, 12b: 2.5 (2 to 3), >= 3.4: missed" in terminal_lines(results)
+    assert status_of(results) == 0
 
 
 def test_the_table_replaces_the_one_between_the_markers() -> None:
@@ -85,6 +96,7 @@ def test_the_table_replaces_the_one_between_the_markers() -> None:
 def test_results_survive_being_saved(tmp_path: Path) -> None:
     results = results_that_meet_all()
     results.processor = {"service": [1.0, 2.0, 3.0]}
+    results.floors = {"12b": [2.0, 2.5]}
     results.save(tmp_path / "results.json")
     assert Results.load(tmp_path / "results.json") == results
 
