@@ -4,6 +4,7 @@ import re
 import subprocess
 import sys
 import time
+from itertools import takewhile
 from pathlib import Path
 
 import pytest
@@ -32,6 +33,14 @@ def shell(build_dir: Path) -> Terminal:
                     env={**os.environ, "PYTHONPATH": str(DEVICE)})
 
 
+def readme_transcripts() -> list[list[str]]:
+    """The steps of the tour that the README shows, as words."""
+    text = (TREE / "README.md").read_text().partition("A piece of what one sees:\n\n")[2]
+    block = "".join(takewhile(lambda line: line.startswith("    ") or line == "\n",
+                              text.splitlines(keepends=True)))
+    return [step.split() for step in block.strip().split("\n\n")]
+
+
 def test_without_a_terminal(build_dir: Path) -> None:
     done = subprocess.run([TREE / "run", "--build", build_dir], stdin=subprocess.DEVNULL,
                           capture_output=True, text=True, timeout=300)
@@ -42,6 +51,11 @@ def test_without_a_terminal(build_dir: Path) -> None:
                  "+anna:x:1000:100:Anna at the desk::/bin/false", "UserDatabaseUpdated ()",
                  "powering the camera off"):
         assert text in done.stdout
+    steps = readme_transcripts()
+    assert len(steps) > 1
+    # Line ends depend on the width, and so do not count; IDs may come out otherwise.
+    said = re.sub(r"uid \d+", "uid 993", " ".join(done.stdout.split()))
+    assert [step for step in steps if " ".join(step) not in said] == []
     interface = (TREE / f"service/{NAME}.xml").read_text()
     methods = re.findall(r'<method name="(\w+)"', interface)
     assert len(methods) == METHODS

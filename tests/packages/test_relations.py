@@ -39,8 +39,8 @@ SYMBOLS = {
 }
 
 # In the list of what a build needs, and nothing that the package of the source would name: a compiler
-# is there always, meson brings ninja, and git and gettext are for working on the tree.
-NOT_NAMED = {"g++", "gettext", "git", "ninja-build"}
+# and dpkg-dev are there always, meson brings ninja, and git and gettext are for working on the tree.
+NOT_NAMED = {"dpkg-dev", "g++", "gettext", "git", "ninja-build"}
 
 
 def listed(purpose: str) -> set[str]:

@@ -36,7 +36,8 @@ GUIDE = RunBy("tests/bus/test_examples.py", "def test_guide_builds_them(")
 BLOCKS: dict[str, dict[str, RunBy | NotRun | Drawing]] = {
     "README.md": {
         "./run": RunBy("tests/device/test_run.py", 'TREE / "run"'),
-        "./test": NotRun("it is what starts tests/source, and this test with it"),
+        "cam-viewer@camera$ gdbus call": RunBy("tests/device/test_run.py", "readme_transcripts()"),
+        "./test": RunBy("tests/release/fresh_machine", '"./run ./test"'),
         "./test proof": NotRun("it takes ten minutes, and is tested by tests/long/test_gate.py"),
         "./bench": NotRun("it takes minutes; its arithmetic is tested by tests/unit/benchmarks"),
         "$ privanectl group list --no-legend": TRANSCRIPTS,
@@ -60,12 +61,14 @@ BLOCKS: dict[str, dict[str, RunBy | NotRun | Drawing]] = {
     "docs/callers.md": {"cc -o caller_c": GUIDE, "gdbus-codegen ": GUIDE},
     "docs/errors.md": {"org.gtk.GDBus.UnmappedGError.": Drawing()},
     "docs/makers.md": {
+        "libauthz1-policy-file ": RunBy("tests/packages/test_quality.py",
+                                        "def test_sizes_as_documented("),
+        "with libauthz1-polkit: ": RunBy("tests/packages/test_quality.py",
+                                         "def test_what_comes_along_on_an_image_as_documented("),
         "make install ": RunBy("tests/bus/test_example_library.py", "def commands("),
     },
     "docs/packages.md": {
         "tools/build_packages": PACKAGES,
-        "libauthz1-policy-file ": RunBy("tests/packages/test_quality.py",
-                                        "def test_sizes_as_documented("),
         "dpkg --install privane-system_": INSTALLS,
         "dpkg --install libauthz1-policy-file_": INSTALLS,
     },
