@@ -71,14 +71,40 @@ def test_an_unchanged_tree_is_not_built_again(packages_dir: Path, packages: dict
     assert {path: path.stat().st_mtime_ns for path in before} == before
 
 
+def shown_sizes(packages_dir: Path) -> str:
+    return subprocess.run([TREE / "tools/installed_sizes", packages_dir], check=True,
+                          capture_output=True, text=True).stdout
+
+
+def guide() -> str:
+    return (TREE / "docs/makers.md").read_text()
+
+
 def test_sizes_as_documented(packages_dir: Path, packages: dict[str, Deb]) -> None:
-    shown = subprocess.run([TREE / "tools/installed_sizes", packages_dir], check=True,
-                           capture_output=True, text=True).stdout
     line = re.compile(r"^ *((?:lib|privane-)\S+) +(\d+) KiB  (.*)$", re.MULTILINE)
-    measured = {name: (int(size), needs) for name, size, needs in line.findall(shown)}
-    documented = {name: (int(size), needs) for name, size, needs in
-                  line.findall((TREE / "docs/packages.md").read_text())}
+    measured = {name: (int(size), needs)
+                for name, size, needs in line.findall(shown_sizes(packages_dir))}
+    documented = {name: (int(size), needs) for name, size, needs in line.findall(guide())}
     assert set(measured) == set(documented) == set(packages)
     for name, (size, needs) in measured.items():
         assert documented[name][1] == needs
         assert abs(documented[name][0] - size) <= TOLERANCE * size, (name, size)
+
+
+def test_what_comes_along_on_an_image_as_documented(packages_dir: Path) -> None:
+    line = re.compile(r"^ *with (libauthz1-\S+): (\d+) KiB of ours, (\d+) MiB of Debian's$",
+                      re.MULTILINE)
+    shown = shown_sizes(packages_dir)
+    measured = {name: sizes for name, *sizes in line.findall(shown)}
+    documented = {name: sizes for name, *sizes in line.findall(guide())}
+    assert set(measured) == set(documented) == {"libauthz1-polkit", "libauthz1-policy-file"}
+    for name, sizes in measured.items():
+        for size, told in zip(map(int, sizes), map(int, documented[name])):
+            assert abs(told - size) <= TOLERANCE * size, (name, size)
+
+    along = [set(names.split(", ")) for names in re.findall(r"^    ([^ ].*)$", shown, re.MULTILINE)]
+    assert len(along) == 2
+    told = re.search(r"Debian's are (.*?), and with polkit (.*?)\.\n\n", guide(), re.DOTALL)
+    assert told
+    without, more = (set(re.split(r",\s+", names)) for names in told.groups())
+    assert (along[0], along[1]) == (without | more, without)
