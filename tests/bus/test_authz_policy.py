@@ -4,10 +4,12 @@ import os
 from typing import Iterator
 
 import pytest
+from gi.repository import GLib
 
 from harness.accounts import (CLERK_UID, STANDARD_GROUP, STANDARD_PASSWD, STANDARD_SHADOW,
                               VIEWER_ROLE_GID, AccountFiles, replace)
 from harness.bus import Bus, BusError, User, domain_error, error_of
+from harness.deadline import wait_for
 from harness.fake_systemd import FakeSystemd
 from harness.interface import ACTION_PREFIX
 from harness.monitor import Monitor
@@ -282,13 +284,24 @@ def test_caller_is_asked_about_once(real_service: Service, bus: Bus, clerk: User
     fresh.close()
 
 
-def test_many_callers_come_and_go(real_service: Service) -> None:
-    """More than are remembered; the match rules of a connection are bounded, too."""
-    for _ in range(3):
-        callers = [Bus() for _ in range(120)]
-        assert [check_user(caller) for caller in callers] == [True] * len(callers)
-        for caller in callers:
-            caller.close()
-    last = Bus()
-    assert check_user(last) is True
-    last.close()
+def match_rules(watcher: Bus, name: str) -> int:
+    """How many the connection has with the bus."""
+    (told,) = watcher.send("org.freedesktop.DBus", "/org/freedesktop/DBus",
+                           "org.freedesktop.DBus.Debug.Stats", "GetConnectionStats",
+                           GLib.Variant("(s)", (name,)))
+    return told["MatchRules"]
+
+
+def test_callers_who_are_gone_leave_no_match_rule(real_service: Service) -> None:
+    """The bus lets a connection have 512, and each caller who is remembered takes one."""
+    watcher = Bus()
+    name = watcher.owner()
+    at_rest = match_rules(watcher, name)
+    callers = [Bus() for _ in range(120)]
+    assert [check_user(caller) for caller in callers] == [True] * len(callers)
+    assert match_rules(watcher, name) == at_rest + len(callers)
+    for caller in callers:
+        caller.close()
+    wait_for("the end of the rules", lambda: match_rules(watcher, name) == at_rest)
+    assert check_user(watcher) is True
+    watcher.close()
