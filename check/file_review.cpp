@@ -7,6 +7,7 @@
 #include <glib.h>
 #include <sys/stat.h>
 
+static constexpr const char *GSHADOW = "/etc/gshadow";
 static constexpr unsigned MODE_BITS = 07777;
 static constexpr unsigned WANTED = STATX_TYPE | STATX_MODE | STATX_UID | STATX_GID;
 
@@ -55,35 +56,63 @@ static void review_mount(const core_file &file, const struct statx &status,
                      "instead"));
 }
 
+static file_state review_missing(const core_file &file, const char *text, findings *out) {
+    const bool can_start = has_shadow_words(file);
+
+    add(out, gravity::UNUSABLE, "missing", file,
+        can_start
+            ? g_strdup_printf("%s: passwords stand in passwd, and no user can be changed", text)
+            : g_strdup(text));
+    return can_start ? file_state::ABSENT : file_state::HOPELESS;
+}
+
+// A link in a circle, or through a file, leads nowhere for the service either. What else failed may
+// succeed when it starts.
+static file_state review_unreadable(const core_file &file, int cause, findings *out) {
+    add(out, gravity::UNUSABLE, "unreadable", file, g_strdup(g_strerror(cause)));
+    return cause == ELOOP || cause == ENOTDIR ? file_state::HOPELESS : file_state::UNKNOWN;
+}
+
+// A folder cannot be read, nor a socket be opened. What else is no file may give any lines, or
+// none, to who opens it, and is not opened here: a pipe would wait for its writer.
+static file_state review_no_file(const core_file &file, unsigned mode, findings *out) {
+    add(out, gravity::UNUSABLE, "no-file", file, g_strdup("is no ordinary file"));
+    return S_ISDIR(mode) || S_ISSOCK(mode) ? file_state::HOPELESS : file_state::UNKNOWN;
+}
+
+static file_state review_link(const core_file &file, findings *out) {
+    add(out, gravity::CHANGE, "symbolic-link", file,
+        g_strdup("is a symbolic link; a write puts a file in its place, and what it leads to "
+                 "stays old"));
+    struct statx target = {};
+    if (statx(AT_FDCWD, file.path, 0, WANTED, &target) != 0)
+        return errno == ENOENT ? review_missing(file, "leads to no file", out)
+                               : review_unreadable(file, errno, out);
+    return S_ISREG(target.stx_mode) ? file_state::READABLE
+                                    : review_no_file(file, target.stx_mode, out);
+}
+
 // Follows no link: the rename that replaces a file does not either.
-bool review_file(const core_file &file, const mount_points &mounts, findings *out) {
+file_state review_file(const core_file &file, const mount_points &mounts, findings *out) {
     struct statx status = {};
-    if (statx(AT_FDCWD, file.path, AT_SYMLINK_NOFOLLOW, WANTED, &status) != 0) {
-        if (errno == ENOENT && file.id == CORE_FILE_ROW_SHADOW)
-            add(out, gravity::NOTICE, "missing", file,
-                g_strdup("is not there: passwords stand in passwd"));
-        else
-            add(out, gravity::UNUSABLE, errno == ENOENT ? "missing" : "unreadable", file,
-                g_strdup(g_strerror(errno)));
-        return false;
-    }
-    if (S_ISLNK(status.stx_mode)) {
-        add(out, gravity::CHANGE, "symbolic-link", file,
-            g_strdup("is a symbolic link; a write puts a file in its place, and what it leads to "
-                     "stays old"));
-        struct statx target = {};
-        if (statx(AT_FDCWD, file.path, 0, WANTED, &target) != 0 || !S_ISREG(target.stx_mode)) {
-            add(out, gravity::UNUSABLE, "unreadable", file, g_strdup("leads to no file"));
-            return false;
-        }
-        return true;
-    }
-    if (!S_ISREG(status.stx_mode)) {
-        add(out, gravity::UNUSABLE, "no-file", file, g_strdup("is no ordinary file"));
-        return false;
-    }
+    if (statx(AT_FDCWD, file.path, AT_SYMLINK_NOFOLLOW, WANTED, &status) != 0)
+        return errno == ENOENT ? review_missing(file, "is not there", out)
+                               : review_unreadable(file, errno, out);
+    if (S_ISLNK(status.stx_mode))
+        return review_link(file, out);
+    if (!S_ISREG(status.stx_mode))
+        return review_no_file(file, status.stx_mode, out);
     review_mount(file, status, mounts, out);
     review_owner(file, status, out);
     review_mode(file, status.stx_mode, out);
-    return true;
+    return file_state::READABLE;
+}
+
+void review_gshadow(findings *out) {
+    struct statx status = {};
+    // What else keeps it from being seen keeps others from it, too.
+    if (statx(AT_FDCWD, GSHADOW, AT_SYMLINK_NOFOLLOW, STATX_TYPE, &status) == 0)
+        out->add(
+            gravity::NOTICE, "gshadow", GSHADOW, 0, nullptr,
+            g_strdup("is there, and is not kept in step with the group file: a device has none"));
 }

@@ -9,14 +9,14 @@
 enum class gravity {
     NOTICE,    // worth knowing; a write keeps it
     CHANGE,    // a write makes it otherwise, or drops what is no account
-    LOSS,      // a write drops an account or a group
+    LOSS,      // a write drops an account or a group, or may
     UNUSABLE,  // the service could not start, or not write
 };
 
 struct finding {
     gravity weight;
-    const char *kind;  // a word of its own for each kind, which scripts may rely on
-    const char *file;  // of core_file_table
+    const char *kind;  // a word of the manual's, which scripts may rely on
+    const char *file;  // of core_file_table, or the gshadow file
     unsigned line;     // from 1; 0: of the whole file
     char *account;     // a user or a group, or null
     char *text;        // a sentence for people; holds no password and no hash

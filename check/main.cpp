@@ -31,45 +31,63 @@ static int status_of(const findings &found) {
     return found.has(gravity::CHANGE) ? LINES_CHANGE : NOTHING_CHANGES;
 }
 
-static void add_error(findings *out, const char *file, const GError *error) {
-    out->add(gravity::UNUSABLE, "unreadable", file, 0, nullptr, g_strdup(error->message));
+// What the lines are could not be found out, though a service may start with them.
+static void add_unjudged(findings *out, const char *file, const char *cause) {
+    out->add(gravity::LOSS, "not-judged", file, 0, nullptr,
+             g_strdup_printf("what a write would drop cannot be told: %s", cause));
 }
 
-static bool read_files(account_file (&files)[CORE_FILE_COUNT], const mount_points &mounts,
-                       findings *out) {
-    bool are_read = true;
-    for (int row = 0; row < CORE_FILE_COUNT; row++) {
-        const core_file &file = core_file_table[row];
-        if (!review_file(file, mounts, out)) {
-            are_read = are_read && row == CORE_FILE_ROW_SHADOW && !out->has(gravity::UNUSABLE);
-            continue;
-        }
-        g_autoptr(GError) error = nullptr;
-        if (!read_account_file(file, &files[row], &error)) {
-            add_error(out, file.path, error);
-            are_read = false;
-        }
-    }
-    return are_read;
-}
-
-static void review_read_files(const account_file (&files)[CORE_FILE_COUNT], findings *out) {
+static void review_all_lines(const account_file (&files)[CORE_FILE_COUNT], findings *out) {
     // What loading logs is told here.
     (void)setlogmask(LOG_MASK(LOG_EMERG));
     g_autoptr(GError) error = nullptr;
     usermgmt_ctx *ctx = usermgmt_open(0, &error);
     if (ctx == nullptr) {
-        add_error(out, core_file_table[CORE_FILE_ROW_PASSWD].path, error);
+        // The files were just read: what failed now may succeed when the service starts.
+        const char *file = core_file_table[CORE_FILE_ROW_PASSWD].path;
+        out->add(gravity::UNUSABLE, "unreadable", file, 0, nullptr, g_strdup(error->message));
+        add_unjudged(out, file, error->message);
         return;
     }
     review_lines(files, ctx, out);
     (void)usermgmt_close(ctx);
 }
 
+// False where they were not all read.
+static bool read_files(const file_state (&states)[CORE_FILE_COUNT],
+                       account_file (&files)[CORE_FILE_COUNT], findings *out) {
+    bool are_read = true;
+    for (int row = 0; row < CORE_FILE_COUNT; row++) {
+        const core_file &file = core_file_table[row];
+        g_autoptr(GError) error = nullptr;
+        if (states[row] == file_state::UNKNOWN) {
+            add_unjudged(out, file.path, "it cannot be read as a file");
+            are_read = false;
+        } else if (states[row] == file_state::READABLE &&
+                   !read_account_file(file, &files[row], &error)) {
+            out->add(gravity::UNUSABLE, "unreadable", file.path, 0, nullptr,
+                     g_strdup(error->message));
+            add_unjudged(out, file.path, error->message);
+            are_read = false;
+        }
+    }
+    return are_read;
+}
+
 static void check_accounts(const mount_points &mounts, findings *out) {
+    file_state states[CORE_FILE_COUNT] = {};
+    bool can_start = true;
+    for (int row = 0; row < CORE_FILE_COUNT; row++) {
+        states[row] = review_file(core_file_table[row], mounts, out);
+        can_start = can_start && states[row] != file_state::HOPELESS;
+    }
+    review_gshadow(out);
+    // A service that does not start loses nothing, and tells itself why.
+    if (!can_start)
+        return;
     account_file files[CORE_FILE_COUNT] = {};
-    if (read_files(files, mounts, out))
-        review_read_files(files, out);
+    if (read_files(states, files, out))
+        review_all_lines(files, out);
     for (account_file &file : files)
         account_file_clear(&file);
 }
@@ -92,7 +110,8 @@ static int guard(const findings &found) {
         return 0;
     }
     (void)std::fputs(
-        "The service is not started: its first change would lose what is named above. "
+        "The service is not started: its first change would lose accounts, or might, as told "
+        "above. "
         "The maker of a device who wants that makes the file " ACCOUNT_LOSS_MARKER ".\n",
         stderr);
     return ACCOUNTS_ARE_LOST;
@@ -112,14 +131,16 @@ static bool parse(int argc, char **argv, settings *out) {
         {"json", 0, G_OPTION_FLAG_NONE, G_OPTION_ARG_STRING, &out->json,
          "short, pretty or off (the default)", "FORM"},
         {"root",     0, G_OPTION_FLAG_NONE, G_OPTION_ARG_FILENAME, &out->root,
-         "look at the files below this folder; needs root", "FOLDER"},
+         "look at the files below this folder", "FOLDER"},
         {             },
     };
     g_autoptr(GOptionContext) context = g_option_context_new("- check the account files");
     g_option_context_set_description(
         context,
         "Tells what a change of any account would do to /etc/passwd, /etc/shadow and /etc/group.\n"
-        "Exit status: 0 nothing; 1 lines would change; 2 usage; 3 accounts would be lost;\n"
+        "Only root may run it.\n"
+        "Exit status: 0 nothing; 1 lines would change; 2 usage, not root, or no such FOLDER;\n"
+        "3 accounts would be lost, or what would be cannot be told;\n"
         "4 the service could not work with these files; 5 what was found could not be told.\n");
     g_option_context_add_main_entries(context, entries, nullptr);
     g_autoptr(GError) error = nullptr;

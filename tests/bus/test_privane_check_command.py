@@ -56,8 +56,8 @@ def test_the_guard_of_the_unit() -> None:
         "/etc/passwd:4: loss: uid-out-of-range: 'human': a write drops the user: the UID 70000 is in "
         "no range of this device"]
     assert refused.stderr == (
-        "The service is not started: its first change would lose what is named above. The maker of "
-        f"a device who wants that makes the file {MARKER}.\n")
+        "The service is not started: its first change would lose accounts, or might, as told above. "
+        f"The maker of a device who wants that makes the file {MARKER}.\n")
     assert refused.returncode == LOSS
     MARKER.parent.mkdir(exist_ok=True)
     MARKER.touch()

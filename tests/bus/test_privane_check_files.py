@@ -8,7 +8,8 @@ from pathlib import Path
 import pytest
 
 from harness.accounts import GROUP, PASSWD, SHADOW, AccountFiles
-from harness.checker import CHANGES, GOOD_PASSWD, NOTHING, UNUSABLE, check, told, write
+from harness.checker import (CHANGES, GOOD_PASSWD, GSHADOW, NOTHING, UNUSABLE, check, told,
+                             write)
 from harness.sandbox import fake_library
 
 FILES = (PASSWD, SHADOW, GROUP)
@@ -101,15 +102,18 @@ def test_mounts_that_cannot_be_known() -> None:
 def test_a_missing_file(path: Path) -> None:
     path.unlink()
     done = check()
-    assert done.stdout == f"{path}: unusable: missing: No such file or directory\n"
+    assert done.stdout == f"{path}: unusable: missing: is not there\n"
     assert done.returncode == UNUSABLE
+
+
+MISSING_SHADOW = ("/etc/shadow: unusable: missing: is not there: passwords stand in passwd, and no user "
+                  "can be changed\n")
 
 
 def test_a_missing_shadow_file() -> None:
     write(GOOD_PASSWD.replace(":x:", ":*:"), None)
     done = check()
-    assert done.stdout == ("/etc/shadow: notice: missing: is not there: passwords stand in passwd\n")
-    assert done.returncode == NOTHING
+    assert (done.stdout, done.returncode) == (MISSING_SHADOW, UNUSABLE)
 
 
 def test_a_file_that_is_none() -> None:
@@ -117,5 +121,38 @@ def test_a_file_that_is_none() -> None:
     os.mkfifo(GROUP)
     done = check()
     GROUP.unlink()
-    assert done.stdout == "/etc/group: unusable: no-file: is no ordinary file\n"
+    assert done.stdout == (
+        "/etc/group: unusable: no-file: is no ordinary file\n"
+        "/etc/group: loss: not-judged: what a write would drop cannot be told: it cannot be read as a "
+        "file\n")
     assert done.returncode == UNUSABLE
+
+
+def test_a_link_in_a_circle() -> None:
+    GROUP.unlink()
+    GROUP.symlink_to("group")
+    done = check()
+    GROUP.unlink()
+    assert done.stdout.splitlines() == [
+        "/etc/group: change: symbolic-link: is a symbolic link; a write puts a file in its place, and "
+        "what it leads to stays old",
+        "/etc/group: unusable: unreadable: Too many levels of symbolic links"]
+    assert done.returncode == UNUSABLE
+
+
+def test_a_gshadow_file() -> None:
+    GSHADOW.write_text("root:*::\n")
+    done = check()
+    guard = check("--guard")
+    GSHADOW.unlink()
+    assert done.stdout == ("/etc/gshadow: notice: gshadow: is there, and is not kept in step with the "
+                           "group file: a device has none\n")
+    assert (done.returncode, guard.returncode, guard.stdout) == (NOTHING, NOTHING, "")
+
+
+def test_a_gshadow_file_is_told_last() -> None:
+    GSHADOW.symlink_to("nowhere")
+    os.chmod(GROUP, 0o666)
+    kinds = [line.split(": ")[2] for line in told()]
+    GSHADOW.unlink()
+    assert kinds == ["open-to-others", "gshadow"]

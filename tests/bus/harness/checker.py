@@ -1,10 +1,13 @@
 """tests/bus/harness/checker.py: privane-check on account files that a test writes."""
 import os
 import subprocess
+from pathlib import Path
 
 from harness.accounts import GROUP, PASSWD, SHADOW, replace
 
 NOTHING, CHANGES, USAGE, LOSS, UNUSABLE, UNTOLD = range(6)
+
+GSHADOW = Path("/etc/gshadow")
 
 GOOD_PASSWD = "root:x:0:0:root:/root:/bin/sh\nalice:x:1001:100:Alice:/home:/bin/false\n"
 GOOD_SHADOW = "root:*:19000:0:99999:7:0::\nalice:$5$salt$hash:19000:0:99999:7:0::\n"
@@ -18,9 +21,10 @@ def check(*options: str, **environment: str) -> subprocess.CompletedProcess[str]
 
 def write(passwd: str = GOOD_PASSWD, shadow: str | None = GOOD_SHADOW,
           group: str = GOOD_GROUP) -> None:
-    """As root's, with modes that nobody minds."""
+    """As root's, with modes that nobody minds, and no gshadow file."""
     replace(PASSWD, passwd, 0o644, 0)
     replace(GROUP, group, 0o644, 0)
+    GSHADOW.unlink(missing_ok=True)
     SHADOW.unlink(missing_ok=True)
     if shadow is not None:
         replace(SHADOW, shadow, 0o600, 0)
