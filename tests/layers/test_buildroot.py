@@ -9,7 +9,7 @@ import kconfiglib
 import pytest
 
 import meson_project
-from conftest import BUILDROOT, TREE
+from conftest import BUILDROOT, PERMANENT_GROUPS, TREE
 from kconfig import FILES, PACKAGE, REFUSED, REQUIRED, SELECTED, Made, load
 
 LIBRARIES = ("libauthz", "libbootparam", "libdigestentry", "liblogbackend", "libparamcli",
@@ -175,10 +175,18 @@ def test_source_may_be_elsewhere(tmp_path: Path) -> None:
 def test_group_is_the_one_of_the_bus_policy(tmp_path: Path) -> None:
     username, uid, group, gid, *rest = Made(tmp_path).values["PRIVANE_SYSTEM_USERS"].split(None, 8)
 
-    assert (username, uid, gid) == ("-", "-", "-1")
+    assert (username, uid, gid) == ("-", "-", "480")
     assert rest[:4] == ["-", "-", "-", "-"] and rest[4]
     assert f'<policy group="{group}">' in (TREE / "data/com.zintor.PrivaneSystem.conf").read_text()
-    assert f"\ng {group} -\n" in (TREE / "data/privane-system.sysusers.conf").read_text()
+    assert re.search(rf"^g {group} (-|\d+)$", (TREE / "data/privane-system.sysusers.conf").read_text(),
+                     re.MULTILINE)
+
+
+def test_gid_is_that_of_the_menu_and_no_dynamic_one(menu: kconfiglib.Kconfig, tmp_path: Path) -> None:
+    symbol = menu.syms[f"{PACKAGE}_GID"]
+
+    assert tuple(end.str_value for end in symbol.ranges[0][:2]) == PERMANENT_GROUPS
+    assert Made(tmp_path, GID="123").values["PRIVANE_SYSTEM_USERS"].split()[2:4] == ["privane", "123"]
 
 
 @pytest.mark.parametrize("replaced", [(), ("libparamcli",), LIBRARIES])

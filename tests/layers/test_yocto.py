@@ -8,7 +8,7 @@ from pathlib import Path
 import pytest
 
 import meson_project
-from conftest import TREE, YOCTO
+from conftest import PERMANENT_GROUPS, TREE, YOCTO
 from recipe import Recipe, SkipRecipe
 
 RECIPES = YOCTO / "recipes-core/privane-system"
@@ -173,9 +173,24 @@ def test_classes() -> None:
                                    "features_check"}
     assert recipe.get("USERADD_PACKAGES") == "privane-system"
     assert recipe.get("SYSTEMD_SERVICE:privane-system") == "privane-system.service"
-    group = re.search(r"^g (\S+) -$", (TREE / "data/privane-system.sysusers.conf").read_text(),
+    group = re.search(r"^g (\S+) (?:-|\d+)$", (TREE / "data/privane-system.sysusers.conf").read_text(),
                       re.MULTILINE)
-    assert group and recipe.get("GROUPADD_PARAM:privane-system") == f"--system {group[1]}"
+    assert group
+    assert recipe.get("GROUPADD_PARAM:privane-system") == f"--system --gid 480 {group[1]}"
+
+
+@pytest.mark.parametrize("gid", PERMANENT_GROUPS)
+def test_gid_is_the_makers(gid: str) -> None:
+    recipe = read_recipe(PRIVANE_GID=gid)
+    recipe.check()
+
+    assert recipe.get("GROUPADD_PARAM:privane-system") == f"--system --gid {gid} privane"
+
+
+@pytest.mark.parametrize("gid", ["0", "500", "", "privane", "-1"])
+def test_gid_is_no_dynamic_one(gid: str) -> None:
+    with pytest.raises(SkipRecipe, match="PRIVANE_GID takes 1 to 499"):
+        read_recipe(PRIVANE_GID=gid).check()
 
 
 def test_two_libauthz_exclude_each_other() -> None:

@@ -61,7 +61,7 @@ PRIVANE_SYSTEM_POST_INSTALL_TARGET_HOOKS += PRIVANE_SYSTEM_REMOVE_REPLACED_LIBRA
 # The bus policy names the group, so it is in the image before anything is started; the sysusers file
 # finds it there.
 define PRIVANE_SYSTEM_USERS
-	- - privane -1 - - - - Callers of the privileged service
+	- - privane $(BR2_PACKAGE_PRIVANE_SYSTEM_GID) - - - - Callers of the privileged service
 endef
 
 $(eval $(meson-package))
