@@ -1,8 +1,10 @@
 """tests/bus/test_privane_check_command.py: the checker's forms of output, guard and manual."""
 import json
+import os
 import re
 import shutil
 import subprocess
+import tempfile
 from pathlib import Path
 
 import pytest
@@ -117,6 +119,45 @@ def test_the_files_of_an_image(tmp_path: Path) -> None:
     missing = check("--root=/nosuch")
     assert (missing.returncode, missing.stderr) == (
         USAGE, "privane-check: /nosuch: No such file or directory\n")
+
+
+DOCUMENT = Path(__file__).parents[2] / "docs" / "images.md"
+
+
+def test_an_image_whose_folder_is_somebody_elses() -> None:
+    """By the command of the guide for who is not root."""
+    (command,) = re.findall(r"`(unshare [^`]+)`", DOCUMENT.read_text())
+    with tempfile.TemporaryDirectory(dir="/tmp") as root:
+        (Path(root) / "etc").mkdir()
+        for path in FILES:
+            shutil.copy2(path, Path(root) / "etc")
+        with (Path(root) / "etc/group").open("a") as group:
+            group.write("big:x:70000:\n")
+        for path in (root, *map(str, Path(root).rglob("*"))):
+            os.chown(path, 701, 701)
+        words = [word.replace("build/check/", "/usr/sbin/").replace("FOLDER", root)
+                 for word in command.split()]
+        done = subprocess.run(["setpriv", "--reuid=701", "--regid=701", "--clear-groups", *words],
+                              capture_output=True, text=True, check=False)
+    assert done.stdout == ("/etc/group:3: loss: gid-out-of-range: 'big': a write drops the group: the GID "
+                           "70000 is in no range of this device\n")
+    assert (done.returncode, done.stderr) == (LOSS, "")
+
+
+def test_a_link_leads_out_of_no_image(tmp_path: Path) -> None:
+    """To the sandbox's own file, which is good, from an image that has no such file."""
+    (tmp_path / "etc").mkdir()
+    for path in FILES:
+        shutil.copy2(path, tmp_path / "etc")
+    assert check(f"--root={tmp_path}").returncode == NOTHING
+    outside = Path("/etc/passwd.outside")
+    outside.write_text(GOOD_PASSWD)
+    (tmp_path / "etc/passwd").unlink()
+    (tmp_path / "etc/passwd").symlink_to("../" * len(tmp_path.parts) + "etc/passwd.outside")
+    done = check(f"--root={tmp_path}")
+    outside.unlink()
+    assert "/etc/passwd: unusable: missing: leads to no file\n" in done.stdout
+    assert done.returncode == UNUSABLE
 
 
 def test_json_is_valid_whatever_a_name_holds() -> None:

@@ -12,7 +12,8 @@ PAGES = sorted(path for folder in ("client", "check", "data", "service")
 # Made by the build, and the manuals of others.
 MADE = {"com.zintor.PrivaneSystem(5)"}
 FOREIGN = {"busctl(1)", "chroot(2)", "crypt(5)", "group(5)", "loginctl(1)", "passwd(5)", "pkaction(1)", "polkit(8)",
-           "shadow(5)", "syslog(3)", "systemctl(1)", "timedatectl(1)", "vipw(8)"}
+           "shadow(5)", "syslog(3)", "systemctl(1)", "timedatectl(1)", "unshare(1)",
+           "vipw(8)"}
 
 REFERENCE = re.compile(r"^\.BR (\S+) \((\d)\)", re.MULTILINE)
 
