@@ -7,6 +7,7 @@
 #include <gtest/gtest.h>
 
 #include "client/client_error.h"
+#include "docs/examples/callers/service_error.hpp"
 
 namespace {
 
@@ -20,7 +21,8 @@ std::string sent(const char *name, const char *text) {
     return line_of(g_dbus_error_new_for_dbus_error(name, text));
 }
 
-// What GDBus makes of a domain and a code is split again.
+// What GDBus makes of a domain and a code is split again, by the client and by the example of the
+// callers' guide.
 TEST(ErrorName, IsSplitAsGDBusWroteIt) {
     static constexpr const char *DOMAINS[] = {"usermgmt", "g-file-error-quark", "a_b.c d"};
     for (const char *name : DOMAINS) {
@@ -32,6 +34,10 @@ TEST(ErrorName, IsSplitAsGDBusWroteIt) {
         ASSERT_TRUE(error_name_split(encoded, &domain, &code)) << encoded;
         EXPECT_STREQ(domain, name);
         EXPECT_EQ(code, 101);
+        const auto decoded = decode_error(encoded);
+        ASSERT_TRUE(decoded) << encoded;
+        EXPECT_EQ(decoded->domain, name);
+        EXPECT_EQ(decoded->code, 101);
     }
 }
 
@@ -43,9 +49,16 @@ TEST(ErrorName, OfAnotherKindIsLeft) {
         "org.gtk.GDBus.UnmappedGError.Quark._usermgmt.Code",
         "org.gtk.GDBus.UnmappedGError.Quark._usermgmt.Code6x",
         "org.gtk.GDBus.UnmappedGError.Quark._usermgmt.Code99999999999",
+        "org.gtk.GDBus.UnmappedGError.Quark._usermgmt.Code-99999999999",
+        "org.gtk.GDBus.UnmappedGError.Quark._usermgmt.Code 6",
         "org.gtk.GDBus.UnmappedGError.Quark._.Code6",
         "org.gtk.GDBus.UnmappedGError.Quark._a_2.Code6",
+        "org.gtk.GDBus.UnmappedGError.Quark._a_",
+        "org.gtk.GDBus.UnmappedGError.Quark._a_.Code6",
         "org.gtk.GDBus.UnmappedGError.Quark._a_zz.Code6",
+        "org.gtk.GDBus.UnmappedGError.Quark._a_2z.Code6",
+        "org.gtk.GDBus.UnmappedGError.Quark._a_-1.Code6",
+        "org.gtk.GDBus.UnmappedGError.Quark._a_+1.Code6",
         "org.gtk.GDBus.UnmappedGError.Quark._a_00.Code6",
         "org.gtk.GDBus.UnmappedGError.Quark._a-b.Code6",
         "",
@@ -57,6 +70,7 @@ TEST(ErrorName, OfAnotherKindIsLeft) {
         EXPECT_FALSE(error_name_split(name, &domain, &code)) << name;
         EXPECT_EQ(domain, nullptr);
         EXPECT_EQ(code, 77);
+        EXPECT_FALSE(decode_error(name)) << name;
     }
 }
 
