@@ -3,6 +3,7 @@
 
 #include <cerrno>
 #include <cstring>
+#include <memory>
 
 #include <unistd.h>
 
@@ -41,39 +42,39 @@ GVariant *build_digest_set(const command_line &line, GError **error) {
     return digest_arguments("set", entry);
 }
 
-// Null with an error. What it held is wiped by its owner, for hashes log in as passwords do.
-static char *read_list(GError **error) {
-    g_auto(wiped_string) list = static_cast<char *>(g_malloc0(LONGEST_LIST + 1));
+// One byte more than a list may have shows that there is more, or ends it.
+using list_bytes = wiped_bytes<LONGEST_LIST + 1>;
+
+// False with an error. Where it is true, the list is a string.
+static bool read_list(list_bytes *list, GError **error) {
     gsize length = 0;
 
     for (;;) {
-        const ssize_t count = read(STDIN_FILENO, list + length, LONGEST_LIST + 1 - length);
+        const ssize_t count = read(STDIN_FILENO, list->bytes + length, sizeof list->bytes - length);
         if (count < 0 && errno == EINTR)
             continue;
-        if (count < 0) {
-            (void)fail_failed(error, "Cannot read the list: %s", g_strerror(errno));
-            return nullptr;
-        }
+        if (count < 0)
+            return fail_failed(error, "Cannot read the list: %s", g_strerror(errno));
         if (count == 0)
             break;
         length += static_cast<gsize>(count);
-        if (length > LONGEST_LIST) {
-            list[LONGEST_LIST] = '\0';
-            (void)fail_failed(error, "The list is longer than %" G_GSIZE_FORMAT " bytes",
-                              LONGEST_LIST);
-            return nullptr;
-        }
+        if (length > LONGEST_LIST)
+            return fail_failed(error, "The list is longer than %" G_GSIZE_FORMAT " bytes",
+                               LONGEST_LIST);
     }
-    if (length == 0 || !g_utf8_validate(list, static_cast<gssize>(length), nullptr)) {
-        (void)fail_failed(error, length == 0 ? "The list is empty" : "The list is no UTF-8 text");
-        return nullptr;
-    }
-    return g_steal_pointer(&list);
+    if (length == 0)
+        return fail_failed(error, "The list is empty");
+    return g_utf8_validate(list->bytes, static_cast<gssize>(length), nullptr) != FALSE ||
+           fail_failed(error, "The list is no UTF-8 text");
 }
 
 GVariant *build_digest_import(const command_line &, GError **error) {
-    g_auto(wiped_string) list = read_list(error);
-    return list != nullptr ? digest_arguments("set", list) : nullptr;
+    // Hashes log in as passwords do, so the list is wiped, too.
+    const auto list = std::make_unique<list_bytes>();
+
+    if (!read_list(list.get(), error))
+        return nullptr;
+    return digest_arguments("set", list->bytes);
 }
 
 GVariant *build_digest_delete(const command_line &line, GError **error) {

@@ -78,16 +78,21 @@ static char *copy_password(const char *line, bool is_new, GError **error) {
 
 // Null with an error, or without one where a signal has ended it; mask as for read_line.
 static char *read_password(int fd, const sigset_t *mask, bool is_new, GError **error) {
-    char line[LONGEST_LINE] = {};
-    char *password = nullptr;
+    wiped_bytes<LONGEST_LINE> line;
 
-    if (read_line(fd, mask, line, sizeof line, error) == line_end::FOUND)
-        password = copy_password(line, is_new, error);
-    explicit_bzero(line, sizeof line);
-    return password;
+    if (read_line(fd, mask, line.bytes, sizeof line.bytes, error) != line_end::FOUND)
+        return nullptr;
+    return copy_password(line.bytes, is_new, error);
 }
 
 char *password_read(int fd, bool is_new, GError **error) {
+    if (isatty(fd) != 0) {
+        (void)fail_usage(error,
+                         "descriptor %d is a terminal, which would show the password; let "
+                         "privanectl ask for it",
+                         fd);
+        return nullptr;
+    }
     return read_password(fd, nullptr, is_new, error);
 }
 

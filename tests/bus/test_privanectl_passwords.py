@@ -11,8 +11,8 @@ import pytest
 
 from harness.changing_accounts import stored_hash
 from harness.passwords import MARK, NEW, OLD, is_hash_of
-from harness.privanectl import (DONE, PROGRAM, Run, Terminal, failed, privanectl, surroundings,
-                                with_password)
+from harness.privanectl import (DONE, PROGRAM, USAGE, Run, Terminal, failed, privanectl,
+                                surroundings, with_password)
 from harness.stage import Stage
 
 NOTHING = Run(DONE, "", "")
@@ -54,6 +54,26 @@ def test_password_may_be_corrected(prompt: Terminal) -> None:
     prompt.type(2 * f"wrong\x15{NEW}x\x7f\n")
     assert prompt.wait() == 0
     assert is_hash_of(stored_hash("bob"), NEW)
+
+
+@pytest.mark.parametrize("descriptor", [0, 1, 2])
+@pytest.mark.parametrize("words", [PASSWD, ("user", "authenticate", "bob"),
+                                   ("user", "modify", "bob"), ("digest", "set", "bob")],
+                         ids=" ".join)
+def test_terminal_is_no_descriptor_of_a_password(words: tuple[str, ...], descriptor: int,
+                                                 stage: Stage) -> None:
+    """It would show what is typed: nobody is asked to type there."""
+    terminal = Terminal(*words, f"--password-fd={descriptor}")
+    try:
+        assert terminal.wait() == USAGE
+        assert terminal.shown == (
+            f"privanectl: descriptor {descriptor} is a terminal, which would show the password; "
+            "let privanectl ask for it\n")
+        assert terminal.echoes()
+    finally:
+        terminal.close()
+    assert stage.calls() == []
+    assert is_hash_of(stored_hash("bob"), OLD)
 
 
 @pytest.mark.parametrize("number", [signal.SIGINT, signal.SIGTERM, signal.SIGHUP])
