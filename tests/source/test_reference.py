@@ -10,7 +10,7 @@ from conftest import TREE
 from reference.errors import HEADERS, Domain, escaped, read_codes, read_domains
 from reference.interface import Failure, Fault, Method, read_interface
 from reference.sources import ROOT, manual_commands
-from reference.texts import arguments, example, signature
+from reference.texts import PASSWORD_WARNING, arguments, example, shows_password, signature
 
 INTERFACE = read_interface()
 
@@ -66,6 +66,31 @@ def test_page_tells_all(method: Method, page: ET.Element) -> None:
                  *(f"{failure.domain} {failure.code} {failure.meaning}"
                    for failure in method.failures), example(INTERFACE, method)):
         assert " ".join(part.split()) in text
+
+
+# Of each method whose example has a password, the command that asks for it.
+ASKING = {"AuthUserBasic": "privanectl user authenticate NAME",
+          "AddUser": "privanectl user add NAME --group=GROUP",
+          "AddUidUser": "privanectl user add NAME --group=GROUP --uid=UID",
+          "ChpasswdUser": "privanectl user passwd NAME"}
+
+
+def test_examples_with_a_password_are_known() -> None:
+    assert {method.name for method in INTERFACE.methods if shows_password(method)} == set(ASKING)
+    assert {method.name for method in INTERFACE.methods if "secret" in method.example} == set(ASKING)
+
+
+@every_method
+def test_example_with_a_password_warns_and_names_what_asks(method: Method, manual: str,
+                                                           page: ET.Element) -> None:
+    shown, text = example(INTERFACE, method), text_of(page)
+
+    if method.name in ASKING:
+        warning = f"{PASSWORD_WARNING} {ASKING[method.name]}"
+        assert f" {shown} Warning {warning}. " in manual
+        assert f" {shown} Warning: {warning} " in text
+    else:
+        assert f" {shown} Warning" not in manual + text
 
 
 def test_page_has_what_it_links_to(page: ET.Element) -> None:

@@ -3,7 +3,8 @@ from typing import Iterator, Mapping, Sequence
 
 from reference.errors import Domain
 from reference.interface import Interface, Method
-from reference.texts import arguments, example, signature
+from reference.texts import (PASSWORD_WARNING, arguments, asking_commands, example,
+                             shows_password, signature)
 
 HEAD = """\
 .\\" Made from the comments of the interface document.
@@ -53,6 +54,8 @@ def method_entry(interface: Interface, method: Method, commands: Sequence[str]) 
     for failure in method.failures:
         yield tagged(f"Error {failure.domain} {failure.code}", failure.meaning)
     yield ".TP\n.B Example\n.nf\n" + escape(example(interface, method)) + "\n.fi\n"
+    if shows_password(method):
+        yield tagged("Warning", f"{PASSWORD_WARNING} {', '.join(asking_commands(commands))}.")
     for command in commands:
         yield tagged("Command", f"privanectl {command}")
 

@@ -4,7 +4,8 @@ from typing import Iterator, Mapping, Sequence
 
 from reference.errors import Domain
 from reference.interface import Interface, Method
-from reference.texts import TYPES, arguments, example, signature
+from reference.texts import (PASSWORD_WARNING, TYPES, arguments, asking_commands, example,
+                             shows_password, signature)
 
 HEAD = """\
 <!DOCTYPE html>
@@ -60,6 +61,9 @@ def method_entry(interface: Interface, method: Method, commands: Sequence[str]) 
     else:
         yield "<p>No errors of its own.</p>\n"
     yield f"<pre>{escape(example(interface, method))}</pre>\n"
+    if shows_password(method):
+        asking = ", ".join(map(code, asking_commands(commands)))
+        yield f"<p><strong>Warning:</strong> {escape(PASSWORD_WARNING)} {asking}.</p>\n"
     yield "".join(f"<pre>{escape(f'privanectl {command}')}</pre>\n" for command in commands)
 
 

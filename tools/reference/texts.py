@@ -1,10 +1,18 @@
 """tools/reference/texts.py: what the forms of the reference have in common."""
+import re
+import shlex
 from typing import Sequence
 
 from reference.interface import Argument, Interface, Method, Signal
 
 # What the examples of the document leave out.
 BUS_CALL = "busctl call {0.name} {0.path} {0.name} "
+
+# Behind an example, in front of the commands that ask for its password.
+PASSWORD_WARNING = ("All users see the arguments of a running program, and so the password of this "
+                    "example. On the terminal it is asked for, and not shown, by")
+
+OPTIONAL = re.compile(r" \[[^]]*\]")
 
 TYPES = {"s": "text", "i": "32-bit number", "u": "32-bit number, not negative",
          "b": "true or false", "as": "list of texts", "ai": "list of numbers",
@@ -27,3 +35,20 @@ def example(interface: Interface, method: Method) -> str:
 def arguments(method: Method) -> list[tuple[str, Argument]]:
     return ([("in", argument) for argument in method.inputs]
             + [("out", argument) for argument in method.outputs])
+
+
+def shows_password(method: Method) -> bool:
+    """Whether the example has a password that is not empty."""
+    words = shlex.split(method.example)[2:]
+    for argument in method.inputs:
+        word = words.pop(0)
+        if argument.name == "password" and word:
+            return True
+        if argument.signature == "as":
+            del words[:int(word)]
+    return False
+
+
+def asking_commands(commands: Sequence[str]) -> list[str]:
+    """The commands as they are written without options that are not needed."""
+    return ["privanectl " + OPTIONAL.sub("", command) for command in commands]
