@@ -16,9 +16,9 @@ from harness.accounts import (GROUP, STANDARD_GROUP, STANDARD_PASSWD,  # noqa: E
                               STANDARD_SHADOW, AccountFiles, replace)
 from harness.bus import Bus  # noqa: E402
 from harness.device import Device  # noqa: E402
-from harness.fake_folder import FakeFolder, StandInTool, together  # noqa: E402
+from harness.fake_folder import FakeClock, StandInTool, together  # noqa: E402
 from harness.fake_systemd import FakeSystemd  # noqa: E402
-from harness.sandbox import SYSTEM_BUS, fake_library, require_sandbox  # noqa: E402
+from harness.sandbox import SYSTEM_BUS, require_sandbox  # noqa: E402
 from harness.service import Service  # noqa: E402
 from harness.world import Neighbour  # noqa: E402
 
@@ -33,14 +33,6 @@ NO_SERVICE = 125
 
 # On a busy machine.
 STOP_SECONDS = 30.0
-
-
-class FakeClock(FakeFolder):
-    """The system's clock, which is set without being set."""
-
-    def environment(self) -> dict[str, str]:
-        return {"LD_PRELOAD": str(fake_library("clock/libclock.so")),
-                "FAKE_CLOCK_DIRECTORY": str(self.directory)}
 
 
 def make_accounts() -> None:

@@ -105,6 +105,14 @@ class FakeBootparam(FakeFolder):
         self.answer("value", value)
 
 
+class FakeClock(FakeFolder):
+    """The system's clock, which is set without being set."""
+
+    def environment(self) -> dict[str, str]:
+        return {"LD_PRELOAD": str(fake_library("clock/libclock.so")),
+                "FAKE_CLOCK_DIRECTORY": str(self.directory)}
+
+
 class FakeRtcClock(FakeFolder):
     """A hardware clock that succeeds until told otherwise."""
 
