@@ -20,6 +20,7 @@ set -euo pipefail
 
 MARK=bus-sandbox # the name of the root's file system: tests know by it that they are inside
 STATE=/run/bus-sandbox
+STOCK_BUS=/usr/share/dbus-1
 DROPPED=-sys_time,-sys_boot,-sys_module,-sys_rawio,-syslog,-wake_alarm
 
 die() { echo "sandbox.sh: $*" >&2; exit 125; }
@@ -40,13 +41,25 @@ while [ $# -gt 0 ]; do
 done
 [ $# -gt 0 ] || die "no command"
 
+# find_polkitd: where it is on this machine, which differs between distributions.
+find_polkitd() {
+    local program
+    for program in /usr/lib/polkit-1/polkitd /usr/libexec/polkitd; do
+        [ ! -x $program ] || { echo $program; return; }
+    done
+    return 1
+}
+
 # Outside: makes the namespaces, and the folder in which the new root is put together.
 enter_namespaces() {
     [ "$(id -u)" = 0 ] || die "needs root"
     local tool scratch status=0
-    for tool in unshare findmnt pivot_root setpriv tar dbus-daemon gdbus systemd-sysusers; do
+    for tool in unshare findmnt mount pivot_root setpriv tar dbus-daemon gdbus systemd-sysusers; do
         command -v $tool >/dev/null || die "needs $tool; run: tools/install_dependencies test"
     done
+    [ -e $STOCK_BUS/system.conf ] ||
+        die "needs dbus-system-bus-common; run: tools/install_dependencies test"
+    find_polkitd >/dev/null || die "needs polkitd; run: tools/install_dependencies test"
     scratch=$(mktemp -d)
     env -i PATH=/usr/sbin:/usr/bin:/sbin:/bin HOME=/root LANG=C.UTF-8 TERM="${TERM:-dumb}" \
         SANDBOX_STAGE=root SANDBOX_SCRATCH="$scratch" \
@@ -161,14 +174,14 @@ enter_root() {
 
 # The stock policy of a system bus, as a foreground program that starts no services.
 write_bus_configuration() {
-    local stock=/usr/share/dbus-1 file includes=''
+    local file includes=''
     for file in ${included[@]+"${included[@]}"}; do
         includes+="<include>$file</include>"
     done
     sed -e '/<fork\/>/d' -e '/<syslog\/>/d' -e '/<pidfile>/d' -e '/<servicehelper>/d' \
         -e '/<standard_system_servicedirs\/>/d' \
-        -e "s|<includedir>system.d<|<includedir>$stock/system.d<|" \
-        -e "s|</busconfig>|$includes</busconfig>|" $stock/system.conf \
+        -e "s|<includedir>system.d<|<includedir>$STOCK_BUS/system.d<|" \
+        -e "s|</busconfig>|$includes</busconfig>|" $STOCK_BUS/system.conf \
         >$STATE/bus.conf
 }
 
@@ -194,13 +207,11 @@ start_bus() {
 
 start_polkitd() {
     local program
-    for program in /usr/lib/polkit-1/polkitd /usr/libexec/polkitd; do
-        [ ! -x $program ] || break
-    done
+    program=$(find_polkitd)
     # It reads its folders as its own user.
     mkdir -p /etc/polkit-1/rules.d /usr/share/polkit-1/rules.d
     chown -R polkitd /etc/polkit-1/rules.d /usr/share/polkit-1/rules.d
-    $program --no-debug >$STATE/polkitd.log 2>&1 &
+    "$program" --no-debug >$STATE/polkitd.log 2>&1 &
     echo $! >$STATE/polkitd.pid
     gdbus wait --system --timeout 10 org.freedesktop.PolicyKit1 ||
         { cat $STATE/polkitd.log >&2; die "no polkitd"; }

@@ -1,8 +1,10 @@
 """tests/kit/run.py: the inside of tools/sandbox: a device around the service, and a command in it.
 
-    run.py LOG CALLS [LIBRARY_FOLDER...] -- COMMAND [ARGUMENT...]
+    run.py FOLDER [LIBRARY_FOLDER...] -- COMMAND [ARGUMENT...]
 
-Ends with the command's status; what the service logged and what it called is in the two files then.
+In the end FOLDER holds the files log and calls, what the service logged and what it called, and, where
+the command was run beside the service to its end, status, its exit status. Where it was not, ends with
+125 and says why.
 """
 import os
 import subprocess
@@ -82,34 +84,50 @@ def run_command(command: list[str]) -> int:
     return status if status >= 0 else 128 - status
 
 
-def main(words: list[str]) -> int:
-    end = words.index("--")
-    log, calls, *libraries = words[:end]
+def wait_for_service(service: Service) -> None:
+    bus = Bus()
+    try:
+        service.wait_registered(bus)
+    except AssertionError:
+        said = service.output() or ["nothing"]
+        raise RuntimeError(f"the service did not start; the last that it said: {said[-1]}") from None
+    bus.close()
+
+
+def run(folder: Path, libraries: list[str], command: list[str]) -> int:
+    """The command's status, with the service there to its end; raises where that cannot be had."""
     require_sandbox()
     process.adopt_orphans()
     make_accounts()
     surroundings = Surroundings()
-    own = [{"LD_LIBRARY_PATH": folder} for folder in libraries]
+    own = [{"LD_LIBRARY_PATH": library} for library in libraries]
     service = Service(environment=together(*own, surroundings.environment()),
                       stop_seconds=STOP_SECONDS)
     try:
-        bus = Bus()
-        service.wait_registered(bus)
-        bus.close()
-        status = run_command(words[end + 1:])
+        wait_for_service(service)
+        status = run_command(command)
         if not service.is_running():
-            print(f"tools/sandbox: the service ended, with status {service.status}",
-                  file=sys.stderr)
-            status = NO_SERVICE
-        elif (ended := service.stop()) != 0:
-            print(f"tools/sandbox: the service stopped with status {ended}", file=sys.stderr)
-            status = NO_SERVICE
+            raise RuntimeError(f"the service ended, with status {service.status}")
+        if (ended := service.stop()) != 0:
+            raise RuntimeError(f"the service stopped with status {ended}")
     finally:
-        Path(log).write_text("".join(f"{line}\n" for line in service.output()))
+        (folder / "log").write_text("".join(f"{line}\n" for line in service.output()))
         service.discard()
-        with Path(calls).open("w") as record:
+        with (folder / "calls").open("w") as record:
             subprocess.run([CALLS_COMMAND], stdout=record, check=True)
         surroundings.close()
+    return status
+
+
+def main(words: list[str]) -> int:
+    end = words.index("--")
+    folder, *libraries = words[:end]
+    try:
+        status = run(Path(folder), libraries, words[end + 1:])
+    except Exception as error:  # Whatever it was, it is no status of the command's.
+        print(f"tools/sandbox: {error}", file=sys.stderr)
+        return NO_SERVICE
+    (Path(folder) / "status").write_text(f"{status}\n")
     return status
 
 
