@@ -1,12 +1,11 @@
 """tests/kit/test_failures.py: what tools/sandbox says where it cannot run the command, with status 125."""
-import os
 import shutil
 import subprocess
 from pathlib import Path
 
 import pytest
 
-from kit import BUILD, NO_SANDBOX, TREE, sandbox
+from kit import BUILD, EXAMPLES, NO_SANDBOX, TREE, sandbox
 from path import programs, stand_in
 
 HOW = "run: tools/install_dependencies build test && tools/build build\n"
@@ -27,13 +26,33 @@ def test_wrong_usage_runs_nothing(words: tuple[str, ...]) -> None:
     assert ended.returncode == NO_SANDBOX and ended.stderr.startswith("tools/sandbox: ")
 
 
-@pytest.mark.parametrize("option", ["--lay", "--library", "--rules", "--write"])
+@pytest.mark.parametrize("option", ["--lay", "--library", "--rules", "--policy", "--write"])
 def test_path_that_is_not_there(option: str) -> None:
     assert refusal(f"{option}=no/such") == f"tools/sandbox: {option}: no/such is not there\n"
 
 
-def test_rules_that_are_no_file(tmp_path: Path) -> None:
-    assert refusal(f"--rules={tmp_path}") == f"tools/sandbox: --rules: {tmp_path} is no file\n"
+@pytest.mark.parametrize("option", ["--rules", "--policy"])
+def test_folder_in_the_place_of_a_file(option: str, tmp_path: Path) -> None:
+    assert refusal(f"{option}={tmp_path}") == f"tools/sandbox: {option}: {tmp_path} is no file\n"
+
+
+def test_rules_beside_a_policy_file() -> None:
+    words = [f"--rules={EXAMPLES}/60-privane-viewer.rules", f"--policy={TREE}/data/authz.conf"]
+
+    assert refusal(*words) == (
+        "tools/sandbox: --rules are polkit's; with --policy it is not asked\n")
+
+
+def test_build_without_the_libauthz_of_the_policy_file(tmp_path: Path) -> None:
+    for folder in (".", "platform", "platform/authz"):
+        (tmp_path / folder).mkdir(exist_ok=True)
+        for entry in (BUILD / folder).iterdir():
+            if entry.name not in ("platform", "authz", "policy"):
+                (tmp_path / folder / entry.name).symlink_to(entry)
+
+    assert refusal(f"--build={tmp_path}", f"--policy={TREE}/data/authz.conf") == (
+        f"policy_library.sh: {tmp_path} lacks the libauthz of the policy file; "
+        "build it with -Dtests=true\n")
 
 
 @pytest.mark.parametrize("option", ["--calls", "--log"])
@@ -85,16 +104,15 @@ def test_program_that_is_missing(program: str, tmp_path: Path) -> None:
 
 
 def test_build_that_is_not_finished(tmp_path: Path) -> None:
-    """What is installed is not there yet."""
+    """It has the stand-ins, and not what is installed."""
     shutil.copytree(BUILD / "meson-private", tmp_path / "meson-private")
-    (tmp_path / "build.ninja").touch()
-    (tmp_path / "tests").symlink_to(BUILD / "tests")
-    stand_in(tmp_path / "bin", "meson", "echo 'ERROR: File could not be found'; exit 1")
-    ended = sandbox(f"--build={tmp_path}", "--", "echo", "ran",
-                    environment={"PATH": f"{tmp_path}/bin:{os.environ['PATH']}"})
+    for name in ("build.ninja", "tests"):
+        (tmp_path / name).symlink_to(BUILD / name)
+    ended = sandbox(f"--build={tmp_path}", "--", "echo", "ran")
 
     assert (ended.returncode, ended.stdout) == (NO_SANDBOX, "")
-    assert f"cannot install {tmp_path} into a temporary folder; make it" in ended.stderr
+    assert ended.stderr.endswith(f"tools/sandbox: cannot install {tmp_path} into a temporary folder; "
+                                 "make it with -Dtests=true, as tools/build build does\n")
 
 
 def test_service_that_does_not_start(tmp_path: Path) -> None:

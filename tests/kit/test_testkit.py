@@ -117,6 +117,30 @@ def test_rules_decide_for_users() -> None:
     assert stranger.returncode == 1 and "AccessDenied" in stranger.stderr
 
 
+def test_policy_file_decides_for_users() -> None:
+    policy = f"--policy={EXAMPLES / 'privane-authz-roles.conf'}"
+    script = f"{{}} {CALL}CheckUser root"
+
+    assert output_of(policy, "--", "sh", "-c", script.format(as_user("viewer"))) == "(true,)\n"
+    refused = sandbox(policy, "--", "sh", "-c", script.format(as_user("clerk")))
+    assert refused.returncode == 1 and "is refused to uid 701" in refused.stderr
+
+
+def test_policy_file_decides_for_root_without_polkit(tmp_path: Path) -> None:
+    """Which polkit would never refuse a thing, and which goes on without it."""
+    policy = tmp_path / "some.conf"
+    policy.write_text("[role some]\nusers=root\nactions=com.zintor.privane-system.checkuser\n")
+    script = f"""
+        kill -KILL $(cat /run/bus-sandbox/polkitd.pid)
+        cat /etc/privane/authz.conf
+        {CALL}CheckUser root
+        {CALL}CheckGroup root"""
+    ended = sandbox(f"--policy={policy}", "--", "sh", "-c", script)
+
+    assert ended.stdout == f"{policy.read_text()}(true,)\n"
+    assert "checkgroup is refused to uid 0" in ended.stderr
+
+
 def test_library_takes_the_place_of_ours() -> None:
     library = BUILD / "docs" / "examples" / "library"
 
@@ -179,7 +203,7 @@ def test_guide_is_right(command: str) -> None:
 
 
 def test_guide_shows_its_commands() -> None:
-    assert len(guide_commands()) == 3
+    assert len(guide_commands()) == 4
 
 
 def test_example_fails_without_the_role(tmp_path: Path) -> None:

@@ -80,7 +80,8 @@ BLOCKS: dict[str, dict[str, RunBy | NotRun | Drawing]] = {
     },
     "docs/testkit.md": {
         start: RunBy("tests/kit/test_testkit.py", "def test_guide_is_right(")
-        for start in ("tools/sandbox -- ", "tools/sandbox --rules=", "tools/sandbox --calls=")},
+        for start in ("tools/sandbox -- ", "tools/sandbox --rules=", "tools/sandbox --policy=",
+                      "tools/sandbox --calls=")},
     "docs/security.md": {"anyone on the device": Drawing()},
 }
 
