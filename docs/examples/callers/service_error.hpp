@@ -49,7 +49,7 @@ inline std::optional<service_error> decode_error(std::string_view name) {
     constexpr std::string_view prefix = "org.gtk.GDBus.UnmappedGError.Quark._";
     constexpr std::string_view mark = ".Code";
     const auto end = name.rfind(mark);
-    if (!name.starts_with(prefix) || end == name.npos || end < prefix.size())
+    if (!name.starts_with(prefix) || end == std::string_view::npos || end < prefix.size())
         return std::nullopt;
 
     const auto domain = decode_domain(name.substr(prefix.size(), end - prefix.size()));
