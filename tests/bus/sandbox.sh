@@ -50,6 +50,9 @@ find_polkitd() {
     return 1
 }
 
+# The caller's may keep the daemons' own users out of what is made here.
+umask 022
+
 # Outside: makes the namespaces, and the folder in which the new root is put together.
 enter_namespaces() {
     [ "$(id -u)" = 0 ] || die "needs root"

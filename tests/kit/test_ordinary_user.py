@@ -73,6 +73,15 @@ def test_records_are_the_users(bin_folder: Path, tmp_path: Path) -> None:
     assert {calls.stat().st_uid, log.stat().st_uid} == {os.getuid()}
 
 
+def test_umask_of_the_user_shuts_nobody_out(bin_folder: Path) -> None:
+    """sudo keeps it where it is the stricter one, and polkitd has a user of its own."""
+    before = os.umask(0o077)
+    try:
+        assert by_user(bin_folder, "--", "sh", "-c", "umask") == (0, "0022\n", "")
+    finally:
+        os.umask(before)
+
+
 def test_sudo_that_refuses(bin_folder: Path) -> None:
     """Its status is no status of the command's."""
     stand_in(bin_folder, "sudo", "echo 'sudo: a password is required' >&2; exit 1")
