@@ -88,7 +88,7 @@ def test_tree_without_a_build(clone: Path) -> None:
 
 
 def test_build_without_the_tests(clone: Path) -> None:
-    """As ./run makes it."""
+    """As Meson makes it unless told otherwise."""
     build = clone / "build"
     subprocess.run(["meson", "setup", build, TREE], check=True, capture_output=True, timeout=300)
 
