@@ -178,7 +178,7 @@ def test_group_is_the_one_of_the_bus_policy(tmp_path: Path) -> None:
     assert (username, uid, gid) == ("-", "-", "480")
     assert rest[:4] == ["-", "-", "-", "-"] and rest[4]
     assert f'<policy group="{group}">' in (TREE / "data/com.zintor.PrivaneSystem.conf").read_text()
-    assert re.search(rf"^g {group} (-|\d+)$", (TREE / "data/privane-system.sysusers.conf").read_text(),
+    assert re.search(rf"^g {group} 480$", (TREE / "data/privane-system.sysusers.conf").read_text(),
                      re.MULTILINE)
 
 

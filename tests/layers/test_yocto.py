@@ -173,7 +173,7 @@ def test_classes() -> None:
                                    "features_check"}
     assert recipe.get("USERADD_PACKAGES") == "privane-system"
     assert recipe.get("SYSTEMD_SERVICE:privane-system") == "privane-system.service"
-    group = re.search(r"^g (\S+) (?:-|\d+)$", (TREE / "data/privane-system.sysusers.conf").read_text(),
+    group = re.search(r"^g (\S+) 480$", (TREE / "data/privane-system.sysusers.conf").read_text(),
                       re.MULTILINE)
     assert group
     assert recipe.get("GROUPADD_PARAM:privane-system") == f"--system --gid 480 {group[1]}"

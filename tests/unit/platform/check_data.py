@@ -262,7 +262,7 @@ class BusFiles(unittest.TestCase):
 
     def test_sysusers_makes_the_group(self):
         lines = (DATA / "privane-system.sysusers.conf").read_text(encoding="utf-8").splitlines()
-        self.assertEqual([line for line in lines if not line.startswith("#")], ["g privane -"])
+        self.assertEqual([line for line in lines if not line.startswith("#")], ["g privane 480"])
 
 
 class BootEnvironmentLock(unittest.TestCase):
