@@ -1,11 +1,11 @@
 """tests/bus/test_authorization_document.py: what docs/authorization.md tells to write and to run does
 what it says."""
 import subprocess
-from pathlib import Path
 from typing import Iterator
 
 import pytest
 
+from document_blocks import block
 from harness.accounts import (CLERK_UID, OPERATOR_ROLE_GID, STANDARD_GROUP, STANDARD_PASSWD,
                               STANDARD_SHADOW, AccountFiles, replace)
 from harness.bus import Bus, User, error_of
@@ -18,20 +18,7 @@ from harness.privanectl import surroundings
 from harness.service import Service
 from harness.service_fixtures import make_user
 
-DOCUMENT = Path(__file__).parents[2] / "docs" / "authorization.md"
 UNITS_GID = 752
-
-
-def block(start: str) -> str:
-    """The indented block whose first line begins so."""
-    lines = DOCUMENT.read_text().splitlines()
-    (first,) = (k for k, line in enumerate(lines) if line.startswith(f"    {start}"))
-    taken = []
-    for line in lines[first:]:
-        if line and not line.startswith("    "):
-            break
-        taken.append(line[4:])
-    return "\n".join(taken).rstrip("\n") + "\n"
 
 
 @pytest.fixture
@@ -53,7 +40,7 @@ def test_rule_grants_one_unit_to_a_group(accounts: AccountFiles, clerk: User, vi
     accounts.write(STANDARD_PASSWD, STANDARD_SHADOW,
                    f"{STANDARD_GROUP}privane-units:x:{UNITS_GID}:clerk\n")
 
-    with local_rules(bus, clerk, block("polkit.addRule(")):
+    with local_rules(bus, clerk, block("docs/authorization.md", "polkit.addRule(")):
         assert clerk.call("RestartService", "s", "sshd") == ()
         assert is_refused(clerk, "RestartService", "ssh")
         assert is_refused(clerk, "StopService", "sshd")
@@ -69,8 +56,8 @@ def test_actions_of_single_units_are_declared(bus: Bus) -> None:
     made = POLICIES / "com.example.camera.units.policy"
     known = set(actions(bus))
     try:
-        subprocess.run(["bash", "-euc", block("privane-unit-actions ")], check=True,
-                       env=surroundings())
+        commands = block("docs/authorization.md", "privane-unit-actions ")
+        subprocess.run(["bash", "-euc", commands], check=True, env=surroundings())
         wait_for("polkitd's new actions", lambda: wanted <= set(actions(bus)), ANSWER_SECONDS)
         assert set(actions(bus)) - known == wanted
     finally:
@@ -85,7 +72,7 @@ def test_policy_file_gives_its_roles(real_service: Service, bus: Bus, privane_gi
     operators = make_user(CLERK_UID, privane_gid, OPERATOR_ROLE_GID)
     operator = next(operators)
     try:
-        replace(POLICY, block("[role root]"), 0o644, 0)
+        replace(POLICY, block("docs/authorization.md", "[role root]"), 0o644, 0)
         assert operator.call("RestartService", "s", "sshd") == ()
         assert is_refused(operator, "RestartService", "ssh")
         assert is_refused(operator, "GetUserList")

@@ -9,6 +9,7 @@ from typing import Callable, Iterator
 
 import pytest
 
+from document_blocks import block
 from harness.bus import Bus
 from harness.fake_authz import FakeAuthz
 from harness.fake_folder import together
@@ -19,7 +20,6 @@ from harness.stage import ROOT_FLAG_SET
 
 TREE = Path(__file__).parents[2]
 EXAMPLE = TREE / "docs" / "examples" / "library"
-GUIDE = TREE / "docs" / "makers.md"
 BUILT = build_directory() / "docs" / "examples" / "library" / "libparamcli.so.1"
 
 STORE = Path("/etc/camera/parameters")
@@ -40,19 +40,14 @@ def no_store() -> Iterator[None]:
     remove()
 
 
-def commands() -> str:
-    """What the guide tells to run for building it."""
-    section = GUIDE.read_text().partition("\n### Building it\n")[2].partition("\n#")[0]
-    return "\n".join(line[4:] for line in section.splitlines() if line.startswith("    "))
-
-
 @pytest.fixture(params=["meson", "make"])
 def library(request: pytest.FixtureRequest, tmp_path: Path) -> Path:
     """The folder of the library, built with the tree, and by the guide's commands away from it."""
     if request.param == "meson":
         return BUILT.parent
     folder = shutil.copytree(EXAMPLE, tmp_path / "library")
-    subprocess.run(["bash", "-euc", commands()], cwd=folder, check=True, timeout=60,
+    commands = block("docs/makers.md", "make install ")
+    subprocess.run(["bash", "-euc", commands], cwd=folder, check=True, timeout=60,
                    env={"PATH": os.environ["PATH"], "TREE": str(TREE),
                         "DESTDIR": str(tmp_path / "image")})
     assert (tmp_path / "image/usr/lib/libparamcli.so.1").resolve().name == "libparamcli.so.1.0.0"

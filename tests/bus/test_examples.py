@@ -7,6 +7,7 @@ from typing import Iterator
 
 import pytest
 
+from document_blocks import block
 from harness.accounts import AccountFiles
 from harness.bus import Bus
 from harness.deadline import wait_for
@@ -128,16 +129,11 @@ def test_wrong_usage_is_told(words: tuple[str, ...], caller: list[str]) -> None:
         2, "", "usage: caller list | check USER | add USER GROUP | watch\n")
 
 
-def build_commands() -> str:
-    """What the guide tells under "Build", as one script."""
-    section = (EXAMPLES.parents[1] / "callers.md").read_text().partition("\n## Build\n")[2]
-    return "\n".join(line[4:] for line in section.splitlines() if line.startswith("    "))
-
-
 def test_guide_builds_them(tmp_path: Path, service: Service, bus: Bus) -> None:
     """With what is installed, and the files of the examples alone."""
     folder = shutil.copytree(EXAMPLES, tmp_path / "callers")
-    ended = subprocess.run(["bash", "-euc", build_commands()], cwd=folder, text=True, check=False,
+    commands = block("docs/callers.md", "cc -o caller_c") + block("docs/callers.md", "gdbus-codegen ")
+    ended = subprocess.run(["bash", "-euc", commands], cwd=folder, text=True, check=False,
                            stdout=subprocess.PIPE, stderr=subprocess.STDOUT)
 
     assert (ended.returncode, ended.stdout) == (0, "")

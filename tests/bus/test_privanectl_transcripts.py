@@ -1,19 +1,18 @@
 """tests/bus/test_privanectl_transcripts.py: what the documents show of the client is what it shows."""
 import shlex
-from pathlib import Path
 
 import pytest
 from _pytest.mark import ParameterSet
 
+from document_blocks import block
 from harness.accounts import AccountFiles
 from harness.bus import Bus
 from harness.passwords import NEW, OLD_HASH
 from harness.privanectl import PROGRAM, Terminal, as_user
 from harness.service_fixtures import StartService
 
-TREE = Path(__file__).parents[2]
 PROMPT = "privanectl "
-ROOT, ALICE = "    $ ", "    alice$ "
+ROOT, ALICE = "$ ", "alice$ "
 
 PASSWD = """\
 root:x:0:0:root:/root:/bin/sh
@@ -23,24 +22,23 @@ SHADOW = f"root:{OLD_HASH}:19000:0:99999:7:0::\nalice:{OLD_HASH}:19000:0:99999:7
 GROUP = "root:x:0:\nusers:x:100:alice\noperator:x:102:alice\n"
 
 
-def transcripts(document: str) -> list[tuple[str, str]]:
-    """The commands that are shown, with the prompt, each with what it prints."""
+def transcripts(text: str) -> list[tuple[str, str]]:
+    """The commands that are shown, with the prompt, each with what it prints: the whole block."""
     found: list[tuple[str, list[str]]] = []
-    is_shown = False
-    for line in (TREE / document).read_text().splitlines():
+    for line in text.splitlines():
         if line.startswith((ROOT + PROMPT, ALICE + PROMPT)):
             found.append((line, []))
-            is_shown = True
-        elif is_shown and (line.startswith("    ") or not line):
-            found[-1][1].append(line[4:])
         else:
-            is_shown = False
+            found[-1][1].append(line)
     return [(command, "\n".join(lines).rstrip()) for command, lines in found]
 
 
+README = transcripts(block("README.md", "$ privanectl group list --no-legend"))
+GUIDE = transcripts(block("docs/privanectl.md", "$ privanectl group list"))
+
+
 def test_there_are_some() -> None:
-    assert len(transcripts("README.md")) == 3
-    assert len(transcripts("docs/privanectl.md")) == 4
+    assert (len(README), len(GUIDE)) == (3, 4)
 
 
 def with_the_libauthz_that_answers(command: str, shown: str) -> ParameterSet:
@@ -50,8 +48,7 @@ def with_the_libauthz_that_answers(command: str, shown: str) -> ParameterSet:
 
 
 @pytest.mark.parametrize("command, shown", [
-    with_the_libauthz_that_answers(*one)
-    for document in ("README.md", "docs/privanectl.md") for one in transcripts(document)])
+    with_the_libauthz_that_answers(*one) for one in README + GUIDE])
 def test_transcript(command: str, shown: str, accounts: AccountFiles, start: StartService,
                     bus: Bus, privane_gid: int) -> None:
     accounts.write_exactly(PASSWD, SHADOW, GROUP)

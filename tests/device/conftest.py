@@ -7,7 +7,7 @@ from pathlib import Path
 import pytest
 
 TREE = Path(__file__).resolve().parents[2]
-sys.path.insert(0, str(TREE / "device"))
+sys.path[:0] = [str(TREE / "device"), str(TREE / "tests")]
 
 from camera.layer_cache import LayerCache  # noqa: E402  (found through the line above)
 from camera.machine import Camera  # noqa: E402

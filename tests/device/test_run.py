@@ -4,7 +4,6 @@ import re
 import subprocess
 import sys
 import time
-from itertools import takewhile
 from pathlib import Path
 
 import pytest
@@ -12,6 +11,7 @@ from camera.errors import CameraError
 from camera.machine import Camera
 from camera.paths import DEVICE, TREE
 from camera.tour import METHODS, NAME, UNIT, Tour
+from document_blocks import block
 from terminal import Terminal
 
 PROMPT = "root@camera:/#"
@@ -35,10 +35,8 @@ def shell(build_dir: Path) -> Terminal:
 
 def readme_transcripts() -> list[list[str]]:
     """The steps of the tour that the README shows, as words."""
-    text = (TREE / "README.md").read_text().partition("A piece of what one sees:\n\n")[2]
-    block = "".join(takewhile(lambda line: line.startswith("    ") or line == "\n",
-                              text.splitlines(keepends=True)))
-    return [step.split() for step in block.strip().split("\n\n")]
+    shown = block("README.md", "cam-viewer@camera$ gdbus call")
+    return [step.split() for step in shown.strip().split("\n\n")]
 
 
 def test_without_a_terminal(build_dir: Path) -> None:

@@ -8,13 +8,16 @@ import pytest
 from deb import Deb
 
 TREE = Path(__file__).resolve().parents[2]
-sys.path.insert(0, str(TREE / "tests/unit"))
+sys.path[:0] = [str(TREE / "tests"), str(TREE / "tests/unit")]
+
+from document_blocks import block  # noqa: E402  (found through the line above)
 
 
 @pytest.fixture(scope="session")
 def packages_dir() -> Path:
     folder = TREE / "build/packages"
-    done = subprocess.run([TREE / "tools/build_packages", folder], capture_output=True, text=True)
+    done = subprocess.run(["bash", "-euc", block("README.md", "tools/build_packages")], cwd=TREE,
+                          capture_output=True, text=True)
     assert done.returncode == 0, done.stderr
     return folder
 

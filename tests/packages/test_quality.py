@@ -8,6 +8,7 @@ from pathlib import Path
 from check_hardening import faults_of_file
 from conftest import TREE
 from deb import Deb
+from document_blocks import block
 
 PROGRAMS = {"usr/sbin/privane_system", "usr/sbin/privane-check", "usr/bin/privanectl"}
 LIBRARIES = ("authz", "bootparam", "digestentry", "logbackend", "paramcli", "rtcclock")
@@ -76,15 +77,13 @@ def shown_sizes(packages_dir: Path) -> str:
                           capture_output=True, text=True).stdout
 
 
-def guide() -> str:
-    return (TREE / "docs/makers.md").read_text()
-
-
 def test_sizes_as_documented(packages_dir: Path, packages: dict[str, Deb]) -> None:
     line = re.compile(r"^ *((?:lib|privane-)\S+) +(\d+) KiB  (.*)$", re.MULTILINE)
     measured = {name: (int(size), needs)
                 for name, size, needs in line.findall(shown_sizes(packages_dir))}
-    documented = {name: (int(size), needs) for name, size, needs in line.findall(guide())}
+    told = block("docs/makers.md", "libauthz1-policy-file ")
+    documented = {name: (int(size), needs) for name, size, needs in line.findall(told)}
+    assert len(documented) == len(told.splitlines())
     assert set(measured) == set(documented) == set(packages)
     for name, (size, needs) in measured.items():
         assert documented[name][1] == needs
@@ -96,15 +95,18 @@ def test_what_comes_along_on_an_image_as_documented(packages_dir: Path) -> None:
                       re.MULTILINE)
     shown = shown_sizes(packages_dir)
     measured = {name: sizes for name, *sizes in line.findall(shown)}
-    documented = {name: sizes for name, *sizes in line.findall(guide())}
+    told = block("docs/makers.md", "with libauthz1-polkit: ")
+    documented = {name: sizes for name, *sizes in line.findall(told)}
+    assert len(documented) == len(told.splitlines())
     assert set(measured) == set(documented) == {"libauthz1-polkit", "libauthz1-policy-file"}
     for name, sizes in measured.items():
-        for size, told in zip(map(int, sizes), map(int, documented[name])):
-            assert abs(told - size) <= TOLERANCE * size, (name, size)
+        for size, written in zip(map(int, sizes), map(int, documented[name])):
+            assert abs(written - size) <= TOLERANCE * size, (name, size)
 
     along = [set(names.split(", ")) for names in re.findall(r"^    ([^ ].*)$", shown, re.MULTILINE)]
     assert len(along) == 2
-    told = re.search(r"Debian's are (.*?), and with polkit (.*?)\.\n\n", guide(), re.DOTALL)
-    assert told
-    without, more = (set(re.split(r",\s+", names)) for names in told.groups())
+    listed = re.search(r"Debian's are (.*?), and with polkit (.*?)\.\n\n",
+                       (TREE / "docs/makers.md").read_text(), re.DOTALL)
+    assert listed
+    without, more = (set(re.split(r",\s+", names)) for names in listed.groups())
     assert (along[0], along[1]) == (without | more, without)

@@ -1,19 +1,26 @@
 """tests/source/test_blocks.py: every block of a document is drawn, quoted, or run by a test; where
-none runs it, the reason stands here."""
+none runs it, the reason stands here.
+
+A test that runs a block takes all of it from the document, by tests/document_blocks.py; so what a row
+names it by need only tell it from the others. What none runs stands here whole: whoever changes it
+reads the reason again.
+"""
+import ast
+import re
 from dataclasses import dataclass
 
 import pytest
 
 from conftest import TREE
+from document_blocks import block
 from documents import DOCUMENTS, blocks, quotes, read
 
 
 @dataclass(frozen=True)
 class RunBy:
-    """The test that runs the block, and what shows in it that it does."""
+    """The test that takes the block from the document."""
 
     test: str
-    evidence: str
 
 
 @dataclass(frozen=True)
@@ -26,76 +33,120 @@ class Drawing:
     """Shows something; there is nothing to run."""
 
 
-TRANSCRIPTS = RunBy("tests/bus/test_privanectl_transcripts.py", "def test_transcript(")
-PACKAGES = RunBy("tests/packages/conftest.py", 'TREE / "tools/build_packages"')
+TRANSCRIPTS = RunBy("tests/bus/test_privanectl_transcripts.py")
+AUTHORIZATION = RunBy("tests/bus/test_authorization_document.py")
+GUIDE = RunBy("tests/bus/test_examples.py")
+SIZES = RunBy("tests/packages/test_quality.py")
+FRESH = RunBy("tests/release/fresh_machine")
+KIT = RunBy("tests/kit/test_testkit.py")
 INSTALLS = NotRun(
     "it changes the machine; tests/packages holds what is installed, asked for, excluded and run then")
-GUIDE = RunBy("tests/bus/test_examples.py", "def test_guide_builds_them(")
+PROOF = NotRun(
+    "it takes ten minutes and more; tests/long/test_gate.py and tests/long/test_long_run.py test what "
+    "is started, with proofs of their own")
+BITBAKE = NotRun("there is no bitbake, as docs/images.md says; tests/layers reads what it names")
+BUILDROOT = NotRun("there is no Buildroot, as docs/images.md says; tests/layers reads what it names")
 
-# Of each document its blocks, by what they begin with.
+# Of each document its blocks, by what they begin with, or whole where nothing runs them.
 BLOCKS: dict[str, dict[str, RunBy | NotRun | Drawing]] = {
     "README.md": {
-        "./run": RunBy("tests/device/test_run.py", 'TREE / "run"'),
-        "cam-viewer@camera$ gdbus call": RunBy("tests/device/test_run.py", "readme_transcripts()"),
-        "./test": RunBy("tests/release/fresh_machine", '"./run ./test"'),
-        "./test proof": NotRun("it takes ten minutes, and is tested by tests/long/test_gate.py"),
+        "./run": FRESH,
+        "cam-viewer@camera$ gdbus call": RunBy("tests/device/test_run.py"),
+        "./test": FRESH,
+        "./test proof": PROOF,
         "./bench": NotRun("it takes minutes; its arithmetic is tested by tests/unit/benchmarks"),
         "$ privanectl group list --no-legend": TRANSCRIPTS,
         " caller ": Drawing(),
-        "tools/build_packages": PACKAGES,
-        "meson setup build": NotRun(
-            "it changes the machine; tools/build and tests/bus/run do it into folders of their own, "
-            "and device/assemble_image lays the result down as an installation would"),
+        "tools/build_packages": RunBy("tests/packages/conftest.py"),
+        "meson setup build": RunBy("tests/packages/test_install_from_source.py"),
     },
     "docs/architecture.md": {
         "+---": Drawing(), "caller ": Drawing(), "usermgmt_add_user": Drawing(),
         "log back-end": Drawing(),
     },
     "docs/authorization.md": {
-        "polkit.addRule(": RunBy("tests/bus/test_authorization_document.py",
-                                 'block("polkit.addRule(")'),
-        "privane-unit-actions ": RunBy("tests/bus/test_authorization_document.py",
-                                       'block("privane-unit-actions ")'),
-        "[role root]": RunBy("tests/bus/test_authorization_document.py", 'block("[role root]")'),
+        "polkit.addRule(": AUTHORIZATION,
+        "privane-unit-actions ": AUTHORIZATION,
+        "[role root]": AUTHORIZATION,
     },
     "docs/callers.md": {"cc -o caller_c": GUIDE, "gdbus-codegen ": GUIDE},
     "docs/errors.md": {"org.gtk.GDBus.UnmappedGError.": Drawing()},
     "docs/makers.md": {
-        "libauthz1-policy-file ": RunBy("tests/packages/test_quality.py",
-                                        "def test_sizes_as_documented("),
-        "with libauthz1-polkit: ": RunBy("tests/packages/test_quality.py",
-                                         "def test_what_comes_along_on_an_image_as_documented("),
-        "make install ": RunBy("tests/bus/test_example_library.py", "def commands("),
+        "libauthz1-policy-file ": SIZES,
+        "with libauthz1-polkit: ": SIZES,
+        "make install ": RunBy("tests/bus/test_example_library.py"),
     },
     "docs/packages.md": {
-        "tools/build_packages": PACKAGES,
-        "dpkg --install privane-system_": INSTALLS,
-        "dpkg --install libauthz1-policy-file_": INSTALLS,
+        "tools/build_packages [FOLDER]": NotRun(
+            "it is the form of the command; the one of the README is run by tests/packages/conftest.py"),
+        """\
+dpkg --install privane-system_*.deb libauthz1-polkit_*.deb libbootparam1_*.deb \\
+    libdigestentry1_*.deb liblogbackend1_*.deb libparamcli1_*.deb librtcclock1_*.deb""": INSTALLS,
+        "dpkg --install libauthz1-policy-file_*.deb": INSTALLS,
     },
     "docs/privanectl.md": {"$ privanectl group list": TRANSCRIPTS},
     "docs/reliability.md": {
-        "./test proof": NotRun(
-            "it takes ten minutes and more; tests/long/test_gate.py and tests/long/test_long_run.py "
-            "test what is started, with proofs of their own"),
+        """\
+./test proof                        a little of each proof, in minutes
+tests/long/run --minutes 90         as much of all of them as fits; goes on where it stopped
+tests/long/run --minutes 30 races   of some of them
+tests/long/run --show               the figures so far; with --markdown, the table below""": PROOF,
     },
     "docs/testkit.md": {
-        start: RunBy("tests/kit/test_testkit.py", "def test_guide_is_right(")
-        for start in ("tools/sandbox -- ", "tools/sandbox --rules=", "tools/sandbox --policy=",
-                      "tools/sandbox --calls=")},
+        "tools/sandbox -- ": KIT, "tools/sandbox --rules=": KIT,
+        "tools/sandbox --policy=": KIT, "tools/sandbox --calls=": KIT,
+    },
     "docs/security.md": {"anyone on the device": Drawing()},
+    "packaging/buildroot/README.md": {
+        "make BR2_EXTERNAL=/path/to/privane_system/packaging/buildroot menuconfig": BUILDROOT,
+    },
+    "packaging/yocto/meta-privane/README.md": {
+        "bitbake-layers add-layer /path/to/privane_system/packaging/yocto/meta-privane": BITBAKE,
+        """\
+INHERIT += "externalsrc"
+EXTERNALSRC:pn-privane-system = "/path/to/privane_system\"""": BITBAKE,
+        """\
+PRIVANE_SYSTEM_SRC_URI = "git://git.example.com/privane_system.git;protocol=https;branch=main"
+SRCREV:pn-privane-system = "0123456789abcdef0123456789abcdef01234567\"""": BITBAKE,
+        """\
+inherit privane-image
+IMAGE_INSTALL:append = " privane-system privane-system-tools\"""": BITBAKE,
+        'PRIVANE_LIBRARY_PROVIDERS:pn-privane-system = "libparamcli.so.1:acme-parameters"': BITBAKE,
+    },
 }
 
 
 def row_of(document: str, text: str) -> str | None:
-    """The longest beginning that fits: one command may begin as another does."""
-    fitting = [start for start in BLOCKS.get(document, {})
-               if text.startswith(start)]
+    """What names the block: all of it, or the longest beginning, since one command may begin as another
+    does."""
+    rows = BLOCKS.get(document, {})
+    whole = text.removesuffix("\n")
+    if whole in rows:
+        return whole
+    fitting = [start for start, row in rows.items()
+               if text.startswith(start) and not isinstance(row, NotRun)]
     return max(fitting, key=len, default=None)
 
 
 def unquoted(document: str) -> list[str]:
     quoted = {text for text, _ in quotes(document)}
-    return [block.text for block in blocks(read(document)) if block.text not in quoted]
+    return [found.text for found in blocks(read(document)) if found.text not in quoted]
+
+
+def taken_by(test: str) -> set[tuple[str, str]]:
+    """The document and the start of each block that the test takes: in Python a call of block, elsewhere
+    one of the program."""
+    text = (TREE / test).read_text()
+    if not test.endswith(".py"):
+        return set(re.findall(r'document_blocks\.py" (\S+) ([^\s)]+)', text))
+    tree = ast.parse(text)
+    imports = [node for node in ast.walk(tree) if isinstance(node, ast.ImportFrom)
+               and node.module == "document_blocks" and "block" in [name.name for name in node.names]]
+    assert imports, f"{test} takes no block"
+    calls = [node for node in ast.walk(tree) if isinstance(node, ast.Call)
+             and isinstance(node.func, ast.Name) and node.func.id == "block"]
+    return {(document.value, start.value) for document, start in (call.args for call in calls)
+            if isinstance(document, ast.Constant) and isinstance(start, ast.Constant)}
 
 
 @pytest.mark.parametrize("document", DOCUMENTS)
@@ -107,10 +158,19 @@ def test_every_block_has_a_row_and_every_row_a_block(document: str) -> None:
     assert sorted(map(str, found)) == sorted(BLOCKS.get(document, {}))
 
 
-@pytest.mark.parametrize("row", [row for rows in BLOCKS.values() for row in rows.values()
-                                 if isinstance(row, RunBy)], ids=lambda row: row.evidence)
-def test_test_that_runs_it_is_there(row: RunBy) -> None:
-    assert row.evidence in (TREE / row.test).read_text()
+@pytest.mark.parametrize("document, start, row", [
+    (document, start, row) for document, rows in BLOCKS.items() for start, row in rows.items()
+    if isinstance(row, RunBy)])
+def test_test_takes_the_block(document: str, start: str, row: RunBy) -> None:
+    assert (document, start) in taken_by(row.test)
+    assert block(document, start) in unquoted(document)
+
+
+def test_what_no_test_runs_is_compared_whole() -> None:
+    start = "./test proof"
+    assert row_of("README.md", f"{start}\n") == start
+    assert row_of("README.md", f"{start} --fast\n") == "./test"
+    assert row_of("docs/reliability.md", f"{start}\n") is None
 
 
 def test_reasons_name_what_is_there() -> None:

@@ -27,7 +27,7 @@ NAMES = {Path(file).name.removesuffix(".in") for file in FILES}
 TOP = {file.split("/")[0] for file in FILES if "/" in file}
 
 # What documents name that only a build, an installation or the device has.
-ELSEWHERE = {"privane-roles.conf"}
+ELSEWHERE = {"privane-roles.conf", "local.conf"}
 
 
 def is_there(path: str) -> bool:
