@@ -4,9 +4,10 @@ from typing import Callable, Sequence
 
 from reference.errors import read_domains
 from reference.interface import ROOT, Fault, read_interface
-from reference.sources import commands, method_rows, signal_of
+from reference.sources import ACTION_PREFIX, commands, method_rows, signal_of
 
 METHODS_HEAD = ("method", "action", "command of `privanectl`")
+SHORT_HEAD = ("method", f"action, after `{ACTION_PREFIX}`", "command of `privanectl`")
 ERRORS_HEAD = ("error on the bus", "domain and code", "meaning", "methods")
 
 
@@ -22,8 +23,8 @@ def table(head: Sequence[str], rows: Sequence[Sequence[str]]) -> str:
     return row(head) + f"|{'---|' * len(head)}\n" + "".join(row(cells) for cells in rows)
 
 
-def methods_table(root: Path = ROOT) -> str:
-    """The methods that the service answers, in the order of its table."""
+def method_cells(root: Path) -> list[tuple[str, str, str]]:
+    """The methods that the service answers, in the order of its table: name, action, commands."""
     names = {signal_of(method.name): method.name
              for method in read_interface(root / "service/com.zintor.PrivaneSystem.xml").methods}
     verbs = commands(root)
@@ -32,8 +33,19 @@ def methods_table(root: Path = ROOT) -> str:
         if signal not in names:
             raise Fault(f"the interface document has no method for handle-{signal}")
         name = names[signal]
-        rows.append((code(name), code(action), ", ".join(map(code, verbs.get(name, [])))))
-    return table(METHODS_HEAD, rows)
+        rows.append((code(name), action, ", ".join(map(code, verbs.get(name, [])))))
+    return rows
+
+
+def methods_table(root: Path = ROOT) -> str:
+    return table(METHODS_HEAD, [(name, code(action), verbs)
+                                for name, action, verbs in method_cells(root)])
+
+
+def short_methods_table(root: Path = ROOT) -> str:
+    """The same with what all actions begin with in its head alone."""
+    return table(SHORT_HEAD, [(name, code(action.removeprefix(ACTION_PREFIX)), verbs)
+                              for name, action, verbs in method_cells(root)])
 
 
 def errors_table(root: Path = ROOT) -> str:
@@ -46,6 +58,7 @@ def errors_table(root: Path = ROOT) -> str:
 
 
 TABLES: dict[str, tuple[Sequence[str], Callable[[Path], str]]] = {
+    "README.md": (SHORT_HEAD, short_methods_table),
     "docs/methods.md": (METHODS_HEAD, methods_table),
     "docs/errors.md": (ERRORS_HEAD, errors_table),
 }
