@@ -8,6 +8,7 @@ import http.client
 import os
 import random
 import re
+import shlex
 import signal
 import socket
 import stat
@@ -15,6 +16,7 @@ import subprocess
 import sys
 import tempfile
 import time
+from contextlib import ExitStack
 from pathlib import Path
 
 APACHE = "/usr/sbin/apache2"
@@ -111,7 +113,9 @@ class WebServer:
 
 class Library:
     def __init__(self, tool, file):
-        self.process = subprocess.Popen([tool, file], stdin=subprocess.PIPE,
+        # A build for another machine is run by an emulator, which Meson names.
+        emulator = shlex.split(os.environ.get("MESON_EXE_WRAPPER", ""))
+        self.process = subprocess.Popen([*emulator, tool, file], stdin=subprocess.PIPE,
                                         stdout=subprocess.PIPE, text=True)
 
     def run(self, command):
@@ -189,16 +193,15 @@ def main():
     faults = []
     texts = list(odd_texts())
     with tempfile.TemporaryDirectory() as name:
-        server = WebServer(Path(name))
-        library = Library(sys.argv[1], server.file)
-        try:
+        with ExitStack() as stack:
+            server = WebServer(Path(name))
+            stack.callback(server.stop)
+            library = Library(sys.argv[1], server.file)
+            stack.callback(library.stop)
             faults += check_new_file(server, library)
             server.file.chmod(0o644)
             for text in texts:
                 faults += [f"{text!r}: {fault}" for fault in check_text(server, library, text)]
-        finally:
-            server.stop()
-            library.stop()
     for fault in faults:
         print(fault, file=sys.stderr)
     print(f"{len(texts) + 1} files, {len(faults)} faults")
