@@ -62,7 +62,8 @@ def main() -> int:
         signal.signal(number, end_in_order)
     try:
         cache = LayerCache(options.build / "camera", say)
-        with start_camera(cache, options.build, kvm=options.kvm, fresh=options.fresh) as camera:
+        with start_camera(cache, options.build / "packages", kvm=options.kvm,
+                          fresh=options.fresh) as camera:
             tour_and_shell(camera, options.shell)
     except CameraError as error:
         print(f"run: {error}", file=sys.stderr)

@@ -32,6 +32,8 @@ def _fill(work: Path) -> None:
              "--dpkgopt=path-exclude=/usr/share/man/*",
              "--dpkgopt=path-exclude=/usr/share/locale/*",
              "--dpkgopt=path-exclude=/usr/share/doc/*",
+             # The examples of the service are for its users; dpkg heeds the last that fits.
+             "--dpkgopt=path-include=/usr/share/doc/privane-system/*",
              '--aptopt=Acquire::Languages "none"',
              f"--customize-hook={FETCH_KERNEL}",
              f"--customize-hook=download /root/kernel.deb '{kernel}'",

@@ -4,7 +4,6 @@ import shlex
 import textwrap
 from collections.abc import Callable, Sequence
 
-from .bus_call import NAME
 from .errors import CameraError
 from .machine import Camera
 from .root_shell import Result
@@ -55,6 +54,6 @@ class Transcript:
 
 
 def _on_lines(command: str) -> str:
-    """A long call of the service is easier to read with its method on a line of its own."""
-    method = f"-m {NAME}"
-    return command if len(command) < WIDTH else command.replace(method, f"\\\n    {method}")
+    """Of a long command the rest from its option -m on, in a call of the service the method, is easier
+    to read on a line of its own."""
+    return command if len(command) < WIDTH else command.replace(" -m ", " \\\n    -m ", 1)

@@ -1,4 +1,4 @@
-"""device/camera/warm_start.py: from a build to a running camera in the shortest time: the layers,
+"""device/camera/warm_start.py: from packages to a running camera in the shortest time: the layers,
 one boot for each image, and from then on the snapshot that was saved after it."""
 import os
 from collections.abc import Mapping
@@ -12,14 +12,14 @@ from .machine import Camera, machine_key
 BOOTED = "booted"
 
 
-def start_camera(cache: LayerCache, build: Path, *, kvm: bool = False,
+def start_camera(cache: LayerCache, packages: Path, *, kvm: bool = False,
                  fresh: bool = False) -> Camera:
-    """A camera with the service of a built Meson folder, just booted."""
+    """A camera with the packages of a folder, just booted."""
     # Locked until it runs: another run may replace the layers, but not before ours are open.
     with cache.locked():
         if fresh:
             cache.clear()
-        image = make_image(cache, make_base(cache), build)
+        image = make_image(cache, make_base(cache), packages)
         warm = {name: image.folder / f"{name}-booted-{machine_key(kvm)}.qcow2" for name in DISKS}
         if not all(path.exists() for path in warm.values()):
             _boot_once(image, warm, kvm)

@@ -1,5 +1,6 @@
 """tests/device/conftest.py: one camera for the whole session, put back to the state after its boot
 before every test."""
+import subprocess
 import sys
 from collections.abc import Iterator
 from pathlib import Path
@@ -16,15 +17,22 @@ from camera.warm_start import BOOTED, start_camera  # noqa: E402
 
 def pytest_addoption(parser: pytest.Parser) -> None:
     parser.addoption("--build-dir", type=Path, default=TREE / "build",
-                     help="the built Meson folder whose service goes into the camera")
+                     help="where the packages are built, and the camera is kept")
 
 
 @pytest.fixture(scope="session")
 def build_dir(request: pytest.FixtureRequest) -> Path:
+    """As ./run has it, with the packages of the tree as it stands."""
     folder: Path = request.config.getoption("--build-dir").resolve()
-    if not (folder / "build.ninja").exists():
-        pytest.fail(f"{folder} is no Meson build folder; ./test device makes it")
+    done = subprocess.run([TREE / "tools/build_packages", folder / "packages"],
+                          capture_output=True, text=True)
+    assert done.returncode == 0, done.stderr
     return folder
+
+
+@pytest.fixture(scope="session")
+def packages_dir(build_dir: Path) -> Path:
+    return build_dir / "packages"
 
 
 @pytest.fixture(scope="session")
@@ -34,8 +42,8 @@ def layer_cache(request: pytest.FixtureRequest, build_dir: Path) -> LayerCache:
 
 
 @pytest.fixture(scope="session")
-def session_camera(build_dir: Path, layer_cache: LayerCache) -> Iterator[Camera]:
-    with start_camera(layer_cache, build_dir) as camera:
+def session_camera(packages_dir: Path, layer_cache: LayerCache) -> Iterator[Camera]:
+    with start_camera(layer_cache, packages_dir) as camera:
         yield camera
 
 

@@ -87,18 +87,18 @@ def test_a_machine_that_hangs_is_explained_by_its_last_words(camera: Camera) -> 
         camera.run("true", timeout=2)
 
 
-def test_a_camera_ends_with_its_block(build_dir: Path, layer_cache: LayerCache) -> None:
+def test_a_camera_ends_with_its_block(packages_dir: Path, layer_cache: LayerCache) -> None:
     before = set(machines(layer_cache))
     folders = set(layer_cache.folder.glob("run-*"))
-    with pytest.raises(ZeroDivisionError), start_camera(layer_cache, build_dir) as second:
+    with pytest.raises(ZeroDivisionError), start_camera(layer_cache, packages_dir) as second:
         assert set(machines(layer_cache)) - before == {second.pid}
         raise ZeroDivisionError
     assert set(machines(layer_cache)) <= before
     assert set(layer_cache.folder.glob("run-*")) <= folders
 
 
-def test_power_off_is_a_shutdown(build_dir: Path, layer_cache: LayerCache) -> None:
-    with start_camera(layer_cache, build_dir) as second:
+def test_power_off_is_a_shutdown(packages_dir: Path, layer_cache: LayerCache) -> None:
+    with start_camera(layer_cache, packages_dir) as second:
         event = second.power_off()
         assert event["data"] == {"guest": True, "reason": "guest-shutdown"}
         assert not second.running
@@ -136,7 +136,7 @@ def test_a_signal_leaves_no_machine(build_dir: Path, layer_cache: LayerCache,
         assert set(layer_cache.folder.glob("run-*")) <= folders
 
 
-def test_from_the_first_boot_to_the_snapshot(build_dir: Path, layer_cache: LayerCache,
+def test_from_the_first_boot_to_the_snapshot(packages_dir: Path, layer_cache: LayerCache,
                                              camera: Camera) -> None:
     """As after a change of the service: another image, booted once, then its snapshot."""
     shutil.rmtree(layer_cache.folder / "scratch", ignore_errors=True)
@@ -144,10 +144,10 @@ def test_from_the_first_boot_to_the_snapshot(build_dir: Path, layer_cache: Layer
     try:
         (base,) = layer_cache.folder.glob("base-*")
         (scratch.folder / base.name).symlink_to(base)
-        with start_camera(scratch, build_dir) as first:
+        with start_camera(scratch, packages_dir) as first:
             booted = first.read_file(BOOT_ID)
         assert booted != camera.read_file(BOOT_ID)
-        with start_camera(scratch, build_dir) as again:
+        with start_camera(scratch, packages_dir) as again:
             assert again.read_file(BOOT_ID) == booted
     finally:
         shutil.rmtree(scratch.folder)

@@ -1,12 +1,15 @@
 """tests/device/test_policy_file.py: the libauthz that a file answers, on a camera without polkit."""
-import subprocess
 from pathlib import Path
 
 import pytest
 from calls import BusError, ask, wait_for_owner
+from camera.image_layer import package_file
 from camera.machine import Camera
 from camera.tour import REFUSED, UNIT
+from camera.warm_start import BOOTED
+from dpkg import put_packages, run_beside_packages
 
+EXCHANGED = "exchanged"
 POLICY = "/etc/privane/authz.conf"
 ROOT_ROLE = "[role root]\nusers=root\nactions=com.zintor.privane-system.*\n"
 PREFIX = "com.zintor.privane-system."
@@ -23,30 +26,24 @@ def replace_policy(camera: Camera, text: str) -> None:
     camera.run(["mv", f"{POLICY}.new", POLICY]).check()
 
 
-@pytest.fixture(scope="session")
-def library(build_dir: Path, tmp_path_factory: pytest.TempPathFactory) -> bytes:
-    """Without what debuggers need: it goes through the camera's console."""
-    stripped = tmp_path_factory.mktemp("authz") / "libauthz.so.1"
-    subprocess.run(["strip", "-o", stripped, build_dir / "platform/authz/policy/libauthz.so.1"],
-                   check=True)
-    return stripped.read_bytes()
+@pytest.fixture(scope="module")
+def exchanged_camera(session_camera: Camera, packages_dir: Path) -> Camera:
+    """Its libauthz was exchanged as on a device, and it has no polkit any more."""
+    session_camera.restore(BOOTED)
+    put_packages(session_camera, [package_file(packages_dir, "libauthz1-policy-file")])
+    before = wait_for_owner(session_camera)
+    session_camera.run(["systemctl", "mask", "--now", "polkit.service"]).check()
+    run_beside_packages(session_camera, "dpkg --install libauthz1-policy-file_*.deb")
+    assert wait_for_owner(session_camera) != before, "the service has the libauthz that asks polkit"
+    replace_policy(session_camera, ROOT_ROLE)
+    session_camera.save(EXCHANGED)
+    return session_camera
 
 
 @pytest.fixture
-def camera(camera: Camera, library: bytes) -> Camera:
-    """The camera, whose libauthz another package replaced, and which has no polkit any more."""
-    installed = camera.run("readlink -f /usr/lib/*/libauthz.so.1").check().out.strip()
-    camera.put_file(f"{installed}.new", library, 0o755)
-    camera.put_file("/root/authz.conf", ROOT_ROLE.encode())
-    camera.run(f"""set -e
-        mv {installed}.new {installed}
-        install -D -m 644 /root/authz.conf {POLICY}
-        systemctl mask --now polkit.service
-        systemctl restart {UNIT}""", timeout=180).check()
-    owner = wait_for_owner(camera)
-    loaded = camera.run(["grep", "-c", "polkit", f"/proc/{owner}/maps"])
-    assert loaded.out == "0\n", "the service has the libauthz that asks polkit"
-    return camera
+def camera(exchanged_camera: Camera) -> Camera:
+    exchanged_camera.restore(EXCHANGED)
+    return exchanged_camera
 
 
 def refusal(camera: Camera, user: str) -> str:

@@ -22,7 +22,7 @@ from pathlib import Path
 from camera.layer_cache import LayerCache
 from camera.warm_start import start_camera
 build = Path(sys.argv[1])
-with start_camera(LayerCache(build / "camera"), build) as camera:
+with start_camera(LayerCache(build / "camera"), build / "packages") as camera:
     print("still on:", camera.shell.interact(), flush=True)
 """
 

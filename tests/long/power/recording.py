@@ -21,6 +21,7 @@ sys.path.insert(0, str(TREE / "device"))
 
 from camera.base_layer import make_base  # noqa: E402  (found through the line above)
 from camera.errors import CameraError  # noqa: E402, F401
+from camera.host_tool import run_tool  # noqa: E402
 from camera.image_layer import make_image  # noqa: E402
 from camera.layer_cache import LayerCache, key_of  # noqa: E402
 from camera.machine import Camera  # noqa: E402
@@ -91,14 +92,17 @@ class Recordings:
     """The recordings below a build folder."""
 
     def __init__(self, build: Path, say: Callable[[str], None]) -> None:
-        self._build = build.resolve()
+        build = build.resolve()
+        self._packages = build / "packages"
         self._say = say
-        self._program = self._build / "tests/long/power/power_recorder"
+        self._program = build / "tests/long/power/power_recorder"
         if not self._program.exists():
             raise RecordingError(f"{self._program} is not built; ninja makes it in a folder that "
                                  "was set up with -Dtests=true")
-        self._cache = LayerCache(self._build / "camera", say)
-        self._folder = self._build / "power-cuts"
+        # The service is recorded as the tree has it, be it broken on purpose.
+        run_tool(TREE / "tools/build_packages", self._packages)
+        self._cache = LayerCache(build / "camera", say)
+        self._folder = build / "power-cuts"
         self._folder.mkdir(exist_ok=True)
 
     def get(self, file_system: str, seed: int, changes: int, anew: bool) -> RecordedRun:
@@ -121,7 +125,7 @@ class Recordings:
     def _key(self) -> str:
         """Of all that is installed in the camera, and of what makes the recording."""
         with self._cache.locked():
-            image = make_image(self._cache, make_base(self._cache), self._build)
+            image = make_image(self._cache, make_base(self._cache), self._packages)
         makers = [self._program, *(HERE / name for name in ("recording.py", "power_plan.py"))]
         return key_of(((path.name, path) for path in makers), image.folder.name)
 
@@ -137,7 +141,7 @@ class Recordings:
         work = Path(tempfile.mkdtemp(prefix="making-", dir=self._folder))
         try:
             (work / STEPS).write_text(json.dumps([asdict(step) for step in steps], indent=1))
-            with start_camera(self._cache, self._build) as camera:
+            with start_camera(self._cache, self._packages) as camera:
                 length = self._call_in(camera, file_system, steps)
                 camera.quit()
                 _take_from(camera.disks["storage"], work, length)
