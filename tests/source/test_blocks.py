@@ -39,8 +39,7 @@ GUIDE = RunBy("tests/bus/test_examples.py")
 SIZES = RunBy("tests/packages/test_quality.py")
 FRESH = RunBy("tests/release/fresh_machine")
 KIT = RunBy("tests/kit/test_testkit.py")
-INSTALLS = NotRun(
-    "it changes the machine; tests/packages holds what is installed, asked for, excluded and run then")
+PACKAGES = RunBy("tests/device/test_packages.py")
 PROOF = NotRun(
     "it takes ten minutes and more; tests/long/test_gate.py and tests/long/test_long_run.py test what "
     "is started, with proofs of their own")
@@ -79,10 +78,8 @@ BLOCKS: dict[str, dict[str, RunBy | NotRun | Drawing]] = {
     "docs/packages.md": {
         "tools/build_packages [FOLDER]": NotRun(
             "it is the form of the command; the one of the README is run by tests/packages/conftest.py"),
-        """\
-dpkg --install privane-system_*.deb libauthz1-polkit_*.deb libbootparam1_*.deb \\
-    libdigestentry1_*.deb liblogbackend1_*.deb libparamcli1_*.deb librtcclock1_*.deb""": INSTALLS,
-        "dpkg --install libauthz1-policy-file_*.deb": INSTALLS,
+        "dpkg --install privane-system_": PACKAGES,
+        "dpkg --install libauthz1-policy-file_": PACKAGES,
     },
     "docs/privanectl.md": {"$ privanectl group list": TRANSCRIPTS},
     "docs/reliability.md": {
