@@ -1,6 +1,7 @@
 """device/camera/base_layer.py: the slow layer of the camera, made once: Debian's root file system,
 the kernel with the modules the camera needs, and the initrd."""
 import gzip
+import os
 import shutil
 from pathlib import Path
 
@@ -25,9 +26,15 @@ def make_base(cache: LayerCache) -> Path:
                        "making the camera's root file system (about half a minute)", _fill)
 
 
+# Where root makes it, a package's script would end processes of this machine by the path of their
+# program, such as polkitd. An ordinary user's mmdebstrap has PIDs of its own by itself.
+OWN_PIDS = ("unshare", "--pid", "--fork", "--kill-child", "--mount-proc", "--")
+
+
 def _fill(work: Path) -> None:
     kernel = work / "kernel.deb"
-    run_tool("mmdebstrap", "--quiet", "--variant=minbase",
+    apart = OWN_PIDS if os.geteuid() == 0 else ()
+    run_tool(*apart, "mmdebstrap", "--quiet", "--variant=minbase",
              f"--include={','.join(_lines('packages'))}",
              "--dpkgopt=path-exclude=/usr/share/man/*",
              "--dpkgopt=path-exclude=/usr/share/locale/*",
