@@ -66,6 +66,12 @@ def version(packages_dir: Path) -> str:
     return package_version(package_file(packages_dir, "privane-system"))
 
 
+def install_all(camera: Camera, version: str) -> None:
+    """As the document tells, and the tools, which are not needed."""
+    command = block("docs/packages.md", "dpkg --install privane-system_").rstrip()
+    run_beside_packages(camera, f"{command} privane-tools_*.deb".replace("_*", f"_{version}_*"))
+
+
 def use_everything_that_is_kept(camera: Camera) -> None:
     """An account with a password on the web, root's password, of which the parameter store tells, and
     the boot block."""
@@ -130,8 +136,7 @@ def test_installing_the_same_version_again_leaves_the_accounts_alone(camera: Cam
                                                                      version: str) -> None:
     use_everything_that_is_kept(camera)
     before, accessible, first = contents(camera), access(camera), wait_for_owner(camera)
-    command = block("docs/packages.md", "dpkg --install privane-system_").rstrip()
-    run_beside_packages(camera, command.replace("_*", f"_{version}_*"))
+    install_all(camera, version)
     assert wait_for_owner(camera) != first
     assert versions(camera, PACKAGES) == {version}
     assert (contents(camera), access(camera)) == (before, accessible)
@@ -224,12 +229,19 @@ def test_purging_leaves_what_is_documented_and_nothing_else(camera: Camera,
     the_others_run(camera)
 
 
+def test_a_device_without_the_group_gets_it_and_no_gshadow(camera: Camera, version: str) -> None:
+    run_beside_packages(camera, PURGE)
+    camera.run(["groupdel", "privane"]).check()
+    install_all(camera, version)
+    camera.run(["getent", "group", "privane"]).check()
+    all_is_in_order(camera)
+
+
 def test_installing_again_after_a_purge(camera: Camera, version: str) -> None:
     use_everything_that_is_kept(camera)
     accounts = contents(camera)
     run_beside_packages(camera, PURGE)
-    command = block("docs/packages.md", "dpkg --install privane-system_").rstrip()
-    run_beside_packages(camera, f"{command} privane-tools_*.deb".replace("_*", f"_{version}_*"))
+    install_all(camera, version)
     all_is_in_order(camera)
     assert contents(camera) == accounts
     assert ask(camera, "CheckUser", "'anna'") == (True,)
