@@ -3,7 +3,6 @@
 
 #include <cerrno>
 #include <cstring>
-#include <memory>
 
 #include <unistd.h>
 
@@ -70,11 +69,11 @@ static bool read_list(list_bytes *list, GError **error) {
 
 GVariant *build_digest_import(const command_line &, GError **error) {
     // Hashes log in as passwords do, so the list is wiped, too.
-    const auto list = std::make_unique<list_bytes>();
+    list_bytes list;
 
-    if (!read_list(list.get(), error))
+    if (!read_list(&list, error))
         return nullptr;
-    return digest_arguments("set", list->bytes);
+    return digest_arguments("set", list.bytes);
 }
 
 GVariant *build_digest_delete(const command_line &line, GError **error) {
