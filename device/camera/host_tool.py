@@ -1,6 +1,7 @@
 """device/camera/host_tool.py: runs the tools of this machine that make the camera."""
 import os
 import shlex
+import signal
 import subprocess
 import tempfile
 from pathlib import Path
@@ -17,15 +18,17 @@ def run_tool(*argv: str | Path) -> str:
     with tempfile.TemporaryFile() as output:
         try:
             process = subprocess.Popen(words, stdin=subprocess.DEVNULL, stdout=output,
-                                       stderr=subprocess.STDOUT, env=ENVIRONMENT)
+                                       stderr=subprocess.STDOUT, env=ENVIRONMENT,
+                                       start_new_session=True)
         except FileNotFoundError:
             raise CameraError(f"{words[0]} is not installed; this installs all that is needed: "
                               "tools/install_dependencies build camera") from None
         try:
             process.wait()
         except BaseException:
-            # Not kill(): mmdebstrap has mounts and folders to take away first.
-            process.terminate()
+            # Not SIGKILL: mmdebstrap has mounts and folders to take away first. To all of them, since
+            # unshare(1) does not pass it on.
+            os.killpg(process.pid, signal.SIGTERM)
             process.wait()
             raise
         output.seek(0)
