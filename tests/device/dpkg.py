@@ -4,7 +4,6 @@ import subprocess
 from collections.abc import Iterable
 from pathlib import Path
 
-from camera.image_layer import package_file
 from camera.machine import Camera
 
 # Of the camera, where packages are put.

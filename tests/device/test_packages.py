@@ -10,7 +10,7 @@ from accounts import access, contents
 from calls import BusError, ask, owner_pid, wait_for_owner
 from camera.change_tour import DIGEST_FILE
 from camera.image_layer import PACKAGES, package_file
-from camera.layer_cache import LayerCache, files_below
+from camera.layer_cache import LayerCache
 from camera.machine import Camera
 from camera.paths import DEVICE, TREE
 from camera.tour import REFUSED

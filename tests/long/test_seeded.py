@@ -36,6 +36,7 @@ def columns(start: Start) -> int:
     assert option == "-k"
     return sum(wanted in name for name in names)
 
+
 def reach(start: Start) -> int:
     """The units that a start does."""
     if start.proof not in TABLES:

@@ -41,7 +41,7 @@ FRESH = RunBy("tests/release/fresh_machine")
 KIT = RunBy("tests/kit/test_testkit.py")
 PACKAGES = RunBy("tests/device/test_packages.py")
 PROOF = NotRun(
-    "it takes ten minutes and more; tests/long/test_gate.py and tests/long/test_long_run.py test what "
+    "it takes a quarter of an hour and more; tests/long/test_gate.py and tests/long/test_long_run.py test what "
     "is started, with proofs of their own")
 BITBAKE = NotRun("there is no bitbake, as docs/images.md says; tests/layers reads what it names")
 BUILDROOT = NotRun("there is no Buildroot, as docs/images.md says; tests/layers reads what it names")
