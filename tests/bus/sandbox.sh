@@ -123,15 +123,26 @@ make_devices() {
     ln -s /proc/self/fd "$root/dev/fd"
 }
 
+# What stands in somebody's home folder is found by all users of the sandbox, too.
+open_way() { # ROOT DIRECTORY
+    local parent=$2
+    while parent=$(dirname "$parent") && [ "$parent" != / ]; do
+        [ -n "$(find "$1$parent" -maxdepth 0 -perm -a+x)" ] || chmod a+x "$1$parent" ||
+            die "cannot open $parent"
+    done
+}
+
 show_directories() {
     local root=$1 directory
-    for directory in "${shown[@]}"; do
+    for directory in "${shown[@]}" ${through[@]+"${through[@]}"}; do
         mkdir -p "$root$directory"
+        open_way "$root" "$directory"
+    done
+    for directory in "${shown[@]}"; do
         mount --bind "$directory" "$root$directory"
         mount -o remount,bind,ro "$root$directory"
     done
     for directory in ${through[@]+"${through[@]}"}; do
-        mkdir -p "$root$directory"
         mount --bind "$directory" "$root$directory"
     done
 }

@@ -2,6 +2,7 @@
 import os
 import re
 import subprocess
+import tempfile
 from pathlib import Path
 
 import pytest
@@ -162,6 +163,22 @@ def test_current_folder_is_seen_and_written_only_when_allowed(tmp_path: Path) ->
     assert not (tmp_path / "result").exists()
     assert output_of(f"--write={tmp_path}", "--", *write, folder=tmp_path) == "some words\n"
     assert (tmp_path / "result").read_text() == "new\n"
+
+
+def test_folder_in_a_private_one_is_found_by_all_users() -> None:
+    """As a clone in somebody's home folder is."""
+    with tempfile.TemporaryDirectory(dir="/var/tmp") as private:
+        assert Path(private).stat().st_mode & 0o777 == 0o700
+        shown = Path(private, "shown")
+        shown.mkdir()
+        (shown / "words").write_text("some words\n")
+
+        ended = subprocess.run(
+            [TREE / "tests/bus/sandbox.sh", "-r", shown, "--", "setpriv", "--reuid=nobody",
+             "--regid=nogroup", "--clear-groups", "--", "cat", shown / "words"],
+            text=True, capture_output=True, timeout=SECONDS, check=False)
+        assert (ended.returncode, ended.stdout) == (0, "some words\n"), ended
+        assert Path(private).stat().st_mode & 0o777 == 0o700
 
 
 @pytest.mark.parametrize("folder", ["/", "/etc", "/home", "/usr/local", "/proc/self/root/etc/.."])
