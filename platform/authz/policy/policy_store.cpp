@@ -172,7 +172,7 @@ static void take_line(const account_form &form, std::string_view line, GHashTabl
         (void)g_hash_table_insert(ids, kept_name, GUINT_TO_POINTER(static_cast<guint>(id)));
 }
 
-// Where the file cannot be read, nobody is known.
+// Where the file cannot be read to the last name that is wanted, nobody is known.
 static void look_up(const account_form &form, const char *path, GHashTable *wanted, GHashTable *ids,
                     const clock_reading &before, file_stamp *out_stamp) {
     FILE *stream = fopen(path, "re");
@@ -185,10 +185,12 @@ static void look_up(const account_form &form, const char *path, GHashTable *want
     if (stream == nullptr)
         return;
     if (fstat(fileno(stream), &seen) == 0) {
-        while ((length = getline(&line, &size, stream)) >= 0)
+        while (g_hash_table_size(wanted) > 0 && (length = getline(&line, &size, stream)) >= 0)
             take_line(form, {line, static_cast<std::size_t>(length)}, wanted, ids);
         if (ferror(stream) == 0)
             *out_stamp = file_stamp_of(seen, before);
+        else
+            g_hash_table_remove_all(ids);
     }
     std::free(line);
     (void)fclose(stream);  // Nothing was written.

@@ -11,6 +11,7 @@
 
 #include "platform/authz/policy/policy_store.h"
 #include "tests/unit/platform/coarse_times.h"
+#include "tests/unit/platform/line_calls.h"
 #include "tests/unit/platform/scratch_folder.h"
 
 inline const std::string PASSWD = "root:x:0:0:root:/root:/bin/sh\nclerk:x:701:701::/:/bin/sh\n";
@@ -27,6 +28,7 @@ class PolicyStore : public testing::Test {
 
     void TearDown() override {
         reset_times();
+        watch_line_calls();
         policy_store_free(store_);
     }
 

@@ -302,6 +302,41 @@ TEST_F(PolicyStore, TwoNamesMayHaveOneId) {
     EXPECT_EQ(ask(701), "yes");
 }
 
+TEST_F(PolicyStore, AccountFilesAreReadNoFurtherThanNeeded) {
+    folder_.write("passwd", PASSWD + "one:x:1:1:::\ntwo:x:2:2:::\n");
+    watch_line_calls();
+    EXPECT_EQ(ask(701), "yes");
+    EXPECT_EQ(line_calls(), 2);  // Of no group is anything asked.
+
+    grant("groups=root", "x.y");
+    watch_line_calls();
+    EXPECT_EQ(ask(701, {0}), "yes");
+    EXPECT_EQ(line_calls(), 1);
+
+    grant("users=clerk;nobody", "x.y");
+    watch_line_calls();
+    EXPECT_EQ(ask(701), "yes");
+    EXPECT_EQ(line_calls(), 5);
+}
+
+// Also whose lines were read before the error.
+TEST_F(PolicyStore, WithAnAccountFileThatFailsNobodyIsKnown) {
+    grant("users=clerk;nobody", "x.y");
+    watch_line_calls(3);
+    EXPECT_EQ(ask(701), "no");
+    EXPECT_EQ(line_calls(), 3);
+    watch_line_calls();
+    EXPECT_EQ(ask(701), "yes");
+    EXPECT_EQ(line_calls(), 3);
+
+    grant("groups=viewers;nobody", "x.y");
+    watch_line_calls(3);
+    EXPECT_EQ(ask(701, {750}), "no");
+    EXPECT_EQ(line_calls(), 3);
+    watch_line_calls();
+    EXPECT_EQ(ask(701, {750}), "yes");
+}
+
 static gsize open_descriptors() {
     gsize count = 0;
     g_autoptr(GDir) folder = g_dir_open("/proc/self/fd", 0, nullptr);
