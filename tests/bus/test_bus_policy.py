@@ -1,10 +1,12 @@
 """tests/bus/test_bus_policy.py: whom the bus lets own the service's name, and send to it."""
+import signal
 import time
 from pathlib import Path
 
 import pytest
 
-from harness.bus import ACCESS_DENIED, KINDS, NAME, Bus, User, domain_error, error_of
+from harness.accounts import CLERK_UID
+from harness.bus import ACCESS_DENIED, KINDS, NAME, OF_ROOT, Bus, User, domain_error, error_of
 from harness.fake_authz import FakeAuthz
 from harness.interface import ACTION_PREFIX, METHODS
 from harness.polkit import hanging_polkitd
@@ -12,7 +14,7 @@ from harness.sandbox import fake_library
 from harness.service import Service
 from harness.service_fixtures import StartService
 from harness.strace import Attached
-from harness.wire import Wire
+from harness.wire import Wire, as_user
 
 PRIMARY_OWNER = 1
 
@@ -96,6 +98,34 @@ def test_forged_answer_of_polkit_allows_nothing(liar: str, start: StartService, 
     assert answer == domain_error("authz", 4, "Authorization check failed: cannot check action "
                                               f"{ACTION_PREFIX}checkuser: no answer in time")
     assert service.stop() == 0
+
+
+# The service is stopped meanwhile, so that it finds the call and then them, and asks the bus while
+# it still reads them: an answer that the bus had let through would come before its own.
+@pytest.mark.policy_file
+@pytest.mark.parametrize("liar", ["stranger", "clerk"])
+def test_forged_answer_of_the_bus_makes_nobody_root(liar: str, real_service: Service, bus: Bus,
+                                                    privane_gid: int,
+                                                    request: pytest.FixtureRequest) -> None:
+    user: User = request.getfixturevalue(liar)
+    forged = range(1, 100)
+    refused = domain_error("authz", 1, f"Authorization check failed: action {ACTION_PREFIX}"
+                                       f"checkuser is refused to uid {CLERK_UID}")
+    assert bus.call("CheckUser", "s", "root") == (True,)
+    with as_user(CLERK_UID, [privane_gid]):
+        fresh = Wire()
+
+    real_service.kill(signal.SIGSTOP)
+    asked = fresh.send("CheckUser", "s", "root")
+    user.send_alone("reply", address(bus, "unique"), "Told", [*forged] * 20, OF_ROOT)
+    real_service.kill(signal.SIGCONT)
+    told = fresh.until_reply(asked)[-1]
+
+    assert told.answer() == refused
+    assert told.serial in forged  # So was the number of the question, which came before.
+    for _ in range(3):
+        assert fresh.until_reply(fresh.send("CheckUser", "s", "root"))[-1].answer() == refused
+    fresh.close()
 
 
 def test_member_of_the_group_can_call(service: Service, clerk: User) -> None:

@@ -21,6 +21,11 @@ KINDS = {"call": Gio.DBusMessageType.METHOD_CALL, "signal": Gio.DBusMessageType.
 # Longer than anything takes that does not wait for a deadline of its own.
 CALL_TIMEOUT = 10.0
 
+# What its replies say, as GLib writes values: polkit, that something is allowed, and the bus, that
+# root has a connection.
+ALLOWED = "((true, false, @a{ss} {}),)"
+OF_ROOT = "({'UnixUserID': <uint32 0>},)"
+
 UNKNOWN_METHOD = "org.freedesktop.DBus.Error.UnknownMethod"
 ACCESS_DENIED = "org.freedesktop.DBus.Error.AccessDenied"
 
@@ -84,10 +89,9 @@ class Bus:
                          GLib.Variant(f"({signature})", arguments), timeout)
 
     def send_alone(self, kind: str, destination: str, member: str,
-                   serials: Sequence[int] = (1,)) -> None:
+                   serials: Sequence[int] = (1,), says: str = ALLOWED) -> None:
         """Sends messages to which no answer is expected, one for each number of a message that a
-        reply pretends to answer, and waits until the bus has dealt with them. A reply says that
-        polkit allows something."""
+        reply pretends to answer, and waits until the bus has dealt with them."""
         for serial in serials:
             message = Gio.DBusMessage.new_signal(PATH, INTERFACE, member)
             message.set_message_type(KINDS[kind])
@@ -95,7 +99,7 @@ class Bus:
             message.set_destination(destination)
             if kind in ("reply", "error"):
                 message.set_reply_serial(serial)
-                message.set_body(GLib.Variant("((bba{ss}))", ((True, False, {}),)))
+                message.set_body(GLib.Variant.parse(None, says))
             if kind == "error":
                 message.set_error_name(f"{INTERFACE}.Error")
             self.connection.send_message(message, Gio.DBusSendMessageFlags.NONE)
@@ -155,10 +159,10 @@ class User:
         return tuple(reply)
 
     def send_alone(self, kind: str, destination: str, member: str,
-                   serials: Sequence[int] = (1,)) -> None:
+                   serials: Sequence[int] = (1,), says: str = ALLOWED) -> None:
         """As Bus.send_alone()."""
         self._exchange({"ask": "send", "kind": kind, "destination": destination,
-                        "member": member, "serials": list(serials)})
+                        "member": member, "serials": list(serials), "says": says})
 
     def request_name(self, name: str) -> int:
         """The bus's answer: 1 is primary owner."""

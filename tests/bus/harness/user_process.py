@@ -20,7 +20,7 @@ def answer(bus: Bus, request: dict[str, Any]) -> Any:
         return bus.ask_bus("RequestName", "su", request["name"], 0)[0]
     if request["ask"] == "send":
         return bus.send_alone(request["kind"], request["destination"], request["member"],
-                              request["serials"])
+                              request["serials"], request["says"])
     return bus.call(request["member"], request["signature"], *request["arguments"],
                     timeout=request["timeout"], destination=request["destination"])
 
