@@ -37,9 +37,10 @@ DELIVERY_SECONDS = 0.1
 
 @pytest.fixture(autouse=True)
 def packaged_file() -> Iterator[str]:
-    """Its text; the file is there again after the test."""
+    """Its text; the file is there again after the test, and its folder is as it was."""
     packaged = POLICY.read_text()
     yield packaged
+    POLICY.parent.chmod(0o755)
     replace(POLICY, packaged, 0o644, 0)
 
 
@@ -77,6 +78,10 @@ def test_other_mode(table: Table, root: Pipeline) -> None:
     POLICY.chmod(0o664)
     refused_to_root(table, root, ": others than root may write it")
     POLICY.chmod(0o644)
+    POLICY.parent.chmod(0o775)
+    assert ask(root, CHECK_USER).error == failure(
+        CHECK_USER, FAILED, f"{POLICY.parent}: others than root may write it")
+    POLICY.parent.chmod(0o755)
     table.require_service()
 
 

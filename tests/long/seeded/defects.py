@@ -54,7 +54,14 @@ DEFECTS = (
     # The content is the same, and so is its time.
     Defect("unheeded-policy-mode.patch",
            Start("policy_matrix", 46, ("-k", "test_other_mode")),
-           r"^E +assert None == BusError\(.*: others than root may write it"),
+           r"^E +assert None == BusError\(.*/authz\.conf: others than root may write it"),
+    Defect("unheeded-policy-folder.patch",
+           Start("policy_matrix", 46, ("-k", "test_other_mode")),
+           r"^E +AssertionError: assert None == BusError\(.*/privane: others than root may write"),
+    # The caller who was asked about first is root.
+    Defect("credentials-of-another.patch",
+           Start("policy_matrix", 46, ("-k", "test_refused")),
+           r"^E +assert None == BusError\(.* is refused to uid "),
     # The last of the files is new, and those before it are not.
     Defect("reversed-renames.patch", Start("daemon_kills", 60),
            r"^E +against version \d+:\nE +/etc/group: "),
