@@ -84,22 +84,19 @@ def main(build: Path, results_file: Path, disk: Path, commit: str, words: list[s
     names = [word for word in words if word != "quick"]
     started = time.monotonic()
     worlds.add_clients()
-    memory, mounted = Path("/tmp/worlds"), Path("/tmp/ext4")
+    memory = Path("/tmp/worlds")
     memory.mkdir()
-    worlds.mount_ext4(disk / "ext4.img", mounted)
-    results = Results(command="./bench quick" if quick else "./bench", commit=commit,
-                      date=datetime.date.today().isoformat(),
-                      machine=f"{platform.machine()}, {os.cpu_count()} cores, Linux {platform.release()}")
-    try:
+    with worlds.ext4_folder(disk) as (on_disk, file_system):
+        results = Results(command="./bench quick" if quick else "./bench", commit=commit,
+                          date=datetime.date.today().isoformat(),
+                          machine=f"{platform.machine()}, {os.cpu_count()} cores, "
+                                  f"Linux {platform.release()}, {file_system}")
         machine = Machine(build, Gio.bus_get_sync(Gio.BusType.SYSTEM, None))
         time.sleep(0.5)  # polkitd takes up the rule
         with cfgstore(machine.program("cfgstore"), memory) as counting:
-            context = Context(machine, counting, QUICK if quick else FULL, memory, mounted,
+            context = Context(machine, counting, QUICK if quick else FULL, memory, on_disk,
                               started + BUDGET_SECONDS["quick" if quick else "full"])
             measure(context, results, names)
-    finally:
-        subprocess.run(["umount", mounted], check=True)
-        (disk / "ext4.img").unlink()
     results.seconds = time.monotonic() - started
     results.save(results_file)
     print("\n".join(terminal_lines(results)))

@@ -142,7 +142,7 @@ def _next_to_stock(context: Context, users: int, add: tuple[str, str],
 
     with machine.service(worlds["service"]) as service, machine.stock(worlds["stock"]) as stock:
         accounts_daemon = StockDaemon(machine, stock)
-        # It reads the accounts when it is first asked.
+        # What either does once is done before the first visit.
         accounts_daemon.add_and_remove()
         shadow_tools(machine, worlds["tools"])
 
@@ -170,9 +170,11 @@ def add_growth(context: Context) -> Figures:
         times = context.interleave({
             "small": lambda: add_time(machine, services[SMALL], ADD_WITH_ID, changes * 8),
             "large": lambda: add_time(machine, services[LARGE], ADD_WITH_ID, changes),
-            "hash": lambda: floor_time(machine, worlds[SMALL], "hash", 20)})
-    return {"19c": growth_exponents(differences(times["small"], times["hash"]),
-                                    differences(times["large"], times["hash"]), LARGE / SMALL)}
+            "hash": lambda: floor_time(machine, worlds[SMALL], "hash", 20),
+            "pidof": lambda: floor_time(machine, worlds[SMALL], "pidof", 20)})
+    constant = sums(times["hash"], times["pidof"])
+    return {"19c": growth_exponents(differences(times["small"], constant),
+                                    differences(times["large"], constant), LARGE / SMALL)}
 
 
 def pidof_spawn(context: Context) -> Figures:

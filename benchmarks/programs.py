@@ -141,8 +141,16 @@ class Machine:
             process.terminate()
             process.wait(timeout=PATIENCE_SECONDS)
 
-    def service(self, world: World, authz: str = "polkit"):
-        return self.daemon(world.command(SERVICE, "-n"), self.service_environment(authz), BUS_NAME)
+    @contextmanager
+    def service(self, world: World, authz: str = "polkit") -> Iterator[Daemon]:
+        environment = self.service_environment(authz)
+        with self.daemon(world.command(SERVICE, "-n"), environment, BUS_NAME) as running:
+            folder = environment.get("LD_LIBRARY_PATH", "/usr/lib")
+            library, = (path for path in loaded_libraries(running.pid)
+                        if Path(path).name.startswith("libauthz.so"))
+            if not Path(library).is_relative_to(folder):
+                raise RuntimeError(f"the service runs with {library}, and not with {authz}")
+            yield running
 
     def reference(self, world: World, checks: str = "none", names: Path | None = None):
         """Each call is allowed ("none") or checked ("polkit"); in the service's environment."""

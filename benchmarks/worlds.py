@@ -4,9 +4,12 @@ A daemon that runs in a world sees the world's folders in the place of the sandb
 daemons with different accounts, on different file systems, can run side by side.
 """
 import grp
+import os
 import pwd
 import shutil
 import subprocess
+from collections.abc import Iterator
+from contextlib import contextmanager
 from dataclasses import dataclass
 from pathlib import Path
 
@@ -135,15 +138,38 @@ def add_clients() -> None:
         Path(path).mkdir(parents=True, exist_ok=True)
 
 
-def mount_ext4(image: Path, target: Path, megabytes: int = 512) -> None:
-    """An ext4 of its own. The image lies on a disk, so that a sync means one."""
-    image.unlink(missing_ok=True)
-    with image.open("wb") as file:
-        file.truncate(megabytes << 20)
-    subprocess.run(["mkfs.ext4", "-q", "-F", image], check=True)
+@contextmanager
+def ext4_folder(disk: Path) -> Iterator[tuple[Path, str]]:
+    """A folder on ext4, where a sync means one of the disk, and what the file system lies on: the disk
+    that the given folder is on, or where that has another file system an image in it."""
+    kind = subprocess.run(["findmnt", "-no", "FSTYPE", "-T", disk], capture_output=True, text=True,
+                          check=True).stdout.strip()
+    if kind == "ext4":
+        folder = disk / "worlds"
+        shutil.rmtree(folder, ignore_errors=True)  # of a run that was ended
+        folder.mkdir()
+        yield folder, "ext4 on the disk"
+        shutil.rmtree(folder)
+        return
+    image, target = disk / "ext4.img", Path("/tmp/ext4")
+    _make_ext4(image)
     target.mkdir(parents=True)
     _make_loop_devices()
     subprocess.run(["mount", "-o", "loop", image, target], check=True)
+    try:
+        yield target, f"ext4 in a file on {kind}"
+    finally:
+        subprocess.run(["umount", target], check=True)
+        image.unlink()
+
+
+def _make_ext4(image: Path, megabytes: int = 512) -> None:
+    """All of it is allocated, and nothing is put off until it is used."""
+    image.unlink(missing_ok=True)
+    with image.open("wb") as file:
+        os.posix_fallocate(file.fileno(), 0, megabytes << 20)
+    subprocess.run(["mkfs.ext4", "-q", "-F", "-E", "lazy_itable_init=0,lazy_journal_init=0", image],
+                   check=True)
 
 
 def _make_loop_devices() -> None:
