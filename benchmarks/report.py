@@ -9,7 +9,7 @@ import sys
 from dataclasses import asdict, dataclass, field
 from pathlib import Path
 
-from benchmarks.figures import Spread, Verdict, exit_status, judge, spread
+from benchmarks.figures import Bound, Spread, Verdict, exit_status, judge, spread
 from benchmarks.goals import GOALS, Goal
 
 BEGIN, END = "<!-- begin: written by ./bench -->", "<!-- end: written by ./bench -->"
@@ -62,6 +62,14 @@ def floor_rows_of(results: Results) -> list[Row]:
     """How the goal would be judged if the floor stood in the service's place; no verdict of the run."""
     return [row_of(goal, results.floors[goal.number], "") for goal in GOALS
             if goal.number in results.floors]
+
+
+def floor_sides(goal: Goal) -> tuple[str, str]:
+    """What is over what where the floor stands in the service's place: in a bound from above the
+    service is what is measured, in one from below what is measured against."""
+    if goal.bound is Bound.AT_MOST:
+        return f"the floor: {goal.what}", goal.over
+    return goal.what, "the floor"
 
 
 def status_of(results: Results) -> int:
@@ -120,7 +128,7 @@ def markdown(results: Results) -> str:
     lines += ["", "What the floor itself reaches against the same tool, in the same rounds (no goal):", "",
               "| # | what | over | measured (rounds from, to) | goal | verdict if it were the service |",
               "|---|---|---|---|---|---|"]
-    lines += [f"| {row.goal.number} | {row.goal.what} | the floor | {measured_text(row)} | "
+    lines += [f"| {row.goal.number} | {' | '.join(floor_sides(row.goal))} | {measured_text(row)} | "
               f"{goal_text(row.goal, row.goal.goal)} | {row.verdict.value} |"
               for row in floor_rows_of(results)]
     lines += ["", "Processor time of one GetUser, microseconds (of that machine; no goal):", "",

@@ -8,9 +8,9 @@ from pathlib import Path
 from benchmarks.account_changes import ADD, REMOVE
 from benchmarks.bus_calls import (ALLOWING_POLICY, GET_USER, GET_USER_LIST, LARGE, POLICY_FILE, QUERIES,
                                   REFUSED, SMALL, Context, Figures)
-from benchmarks.figures import differences, growth_exponents, ratios, shares
+from benchmarks.figures import differences, growth_exponents, ratios, shares, sums
 from benchmarks.programs import (BUS_NAME, SERVICE, SERVICE_UNIT, STOCK_DAEMON, STOCK_NAME, STOCK_UNIT,
-                                 loaded_libraries, resident_kib, unit_environment)
+                                 loaded_libraries, resident_kib, run, unit_environment)
 from benchmarks.worlds import PASSWORD, SMALL_GROUP, World, make_world, user_name
 
 # After its name a daemon still has things to do; the memory is read when it has come to rest.
@@ -20,7 +20,7 @@ LIBRARIES = ("libauthz", "libbootparam", "libdigestentry", "liblogbackend", "lib
 
 
 def start_times(context: Context) -> Figures:
-    """Goals 14, 15 and 19a."""
+    """Goals 14, 15 and 19a, and what the floor of loading reaches in the place of the service in 15."""
     machine = context.machine
     starts = context.amounts.starts
     worlds = {users: make_world(context.memory, users) for users in (25, SMALL, LARGE)}
@@ -48,8 +48,15 @@ def start_times(context: Context) -> Figures:
                                                      environment)[0]
                                  for _ in range(context.amounts.stock_starts))
 
+    def floor() -> float:
+        """In the service's environment, like the service."""
+        command = [machine.program("load_floor"), worlds[LARGE].path / "etc"]
+        return statistics.median(float(run(command, env=unit_environment(SERVICE_UNIT)))
+                                 for _ in range(starts))
+
     times = context.interleave({"few": service(25), "minimal": minimal, "small": service(SMALL),
-                                "large": service(LARGE), "stock": stock})
+                                "large": service(LARGE), "stock": stock, "floor": floor})
+    context.floors["15"] = ratios(sums(times["minimal"], times["floor"]), times["stock"])
     # Loading is what a start with accounts takes beyond a start with next to none: with the fewer so
     # little that it drowns in what the machine does meanwhile, so the processor time is compared.
     return {"14": ratios(times["few"], times["minimal"]),

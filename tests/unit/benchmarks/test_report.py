@@ -84,6 +84,15 @@ def test_what_the_floor_reaches_is_told_and_decides_nothing() -> None:
     assert status_of(results) == 0
 
 
+def test_the_floor_stands_where_the_service_does() -> None:
+    results = results_that_meet_all()
+    results.floors = {"15": [0.5], "12b": [4.0]}
+    lines = markdown(results).splitlines()
+    assert ("| 15 | the floor: Start to the name, 59,001 users | the accounts daemon | 0.5 | <= 0.45 | "
+            "met within the slack |") in lines
+    assert "| 12b | userdel, 25 users, ext4 | the floor | 4 | >= 3.4 | stretch goal met |" in lines
+
+
 def test_the_table_replaces_the_one_between_the_markers() -> None:
     document = f"before\n{BEGIN}\nold\n{END}\nafter\n"
     written = with_table(document, "new")
