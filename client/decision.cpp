@@ -1,7 +1,9 @@
 // client/decision.cpp: asks the device's own authorization library, and sees what that one asks.
 //
 // The library may be polkit's, the policy file's or the maker's own, and its functions do not tell.
-// What it sends to polkit passes the connection that it shares with this program.
+// What it sends to polkit passes the connection that it shares with this program; the policy file's
+// alone exports the path of its file. That the file is there tells nothing: its package leaves it
+// behind.
 #include "client/decision.h"
 
 #include <cstring>
@@ -14,8 +16,8 @@
 static constexpr const char *LIBRARY = "libauthz.so.1";
 static constexpr const char *POLKIT = "org.freedesktop.PolicyKit1";
 
-// AUTHZ_POLICY_FILE is the build's to choose.
-const char *const POLICY_PATH = AUTHZ_POLICY_FILE;
+// In platform/authz/policy/authz.cpp.
+static constexpr const char *POLICY_PATH_SYMBOL = "authz_policy_path";
 
 // What polkit was asked last. Messages pass on a thread of GDBus's.
 static GMutex asked_mutex;
@@ -79,18 +81,20 @@ static verdict verdict_of(const GError *error) {
     return verdict::NO;
 }
 
-static decider find_decider(const char *asked) {
-    if (asked != nullptr)
-        return decider::POLKIT;
-    return access(POLICY_PATH, F_OK) == 0 ? decider::POLICY_FILE : decider::UNTOLD;
+static void find_decider(void *library, decision *made) {
+    made->policy_file = static_cast<const char *>(dlsym(library, POLICY_PATH_SYMBOL));
+    if (made->asked != nullptr)
+        made->by = decider::POLKIT;
+    else if (made->policy_file != nullptr)
+        made->by = decider::POLICY_FILE;
 }
 
-static const char *name_of(decider by) {
-    switch (by) {
+static const char *name_of(const decision &made) {
+    switch (made.by) {
         case decider::POLKIT:
             return "polkit";
         case decider::POLICY_FILE:
-            return POLICY_PATH;
+            return made.policy_file;
         case decider::UNTOLD:
             break;
     }
@@ -98,7 +102,7 @@ static const char *name_of(decider by) {
 }
 
 static char *reason_of(const decision &made, const GError *error) {
-    const char *who = name_of(made.by);
+    const char *who = name_of(made);
 
     if (made.allowed == verdict::YES)
         return g_strdup_printf("%s allows it", who);
@@ -113,7 +117,7 @@ static char *reason_of(const decision &made, const GError *error) {
 void authorization::decide(GDBusConnection *bus, const char *action_id, decision *out_made) {
     auto *check =
         library_ != nullptr ? find<decltype(authz_check)>(library_, "authz_check") : nullptr;
-    decision made = {verdict::UNKNOWN, nullptr, decider::UNTOLD, nullptr};
+    decision made = {verdict::UNKNOWN, nullptr, decider::UNTOLD, nullptr, nullptr};
 
     if (check != nullptr) {
         (void)g_dbus_connection_add_filter(bus, on_message, nullptr, nullptr);  // For good.
@@ -123,7 +127,7 @@ void authorization::decide(GDBusConnection *bus, const char *action_id, decision
         g_mutex_lock(&asked_mutex);
         made.asked = g_steal_pointer(&asked_action);
         g_mutex_unlock(&asked_mutex);
-        made.by = find_decider(made.asked);
+        find_decider(library_, &made);
     }
     if (made.allowed != verdict::YES && error_ == nullptr)
         g_set_error(&error_, G_FILE_ERROR, G_FILE_ERROR_FAILED, "%s gives no reason", LIBRARY);

@@ -15,6 +15,7 @@ struct decision {
     verdict allowed;
     char *reason;  // for people
     decider by;
+    const char *policy_file;  // with POLICY_FILE, its path, which is the library's
     char *asked;  // the last action that polkit was asked about, which is the one that counts
 };
 
@@ -37,6 +38,3 @@ class authorization {
     void *library_ = nullptr;  // null: error_ tells why
     GError *error_ = nullptr;
 };
-
-// The file of the policy, if that is what decides.
-extern const char *const POLICY_PATH;

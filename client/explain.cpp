@@ -49,7 +49,7 @@ static void find_rule(const method_action &action, const decision &made, finding
     const bool is_role = made.by == decider::POLICY_FILE;
     found->grant = g_strdup_printf(
         "this %s in %s%s", is_role ? "role" : "rule",
-        is_role ? POLICY_PATH : "/etc/polkit-1/rules.d",
+        is_role ? made.policy_file : "/etc/polkit-1/rules.d",
         method_action_amounts_to_root(action) ? ", which amounts to making root" : "");
     if (is_role) {
         found->rule = method_action_example_role(action, g_get_user_name());

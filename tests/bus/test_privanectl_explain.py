@@ -1,12 +1,13 @@
 """tests/bus/test_privanectl_explain.py: what the client tells of actions, with the real polkit."""
 from pathlib import Path
-from typing import Any
+from typing import Any, Iterator
 
 import pytest
 
 from harness.accounts import CLERK_UID, STRANGER_UID, VIEWER_UID, VIEWER_ROLE_GID
 from harness.bus import Bus, User
 from harness.interface import ACTION_PREFIX, METHODS
+from harness.policy_file import POLICY, role
 from harness.polkit import ExampleRules, declared, local_rules
 from harness.privanectl import (DONE, Run, as_user, failed, on_terminal, privanectl, wrong_usage)
 from harness.sandbox import start_bus
@@ -174,6 +175,29 @@ def test_library_of_the_devices_maker(real_service: Service, authz: FakeAuthz) -
                      unknown, None)
     assert privanectl("explain", "GetUser", environment=authz.environment()).output.endswith(
         f"Granted by: {unknown}\n")
+
+
+@pytest.fixture
+def policy_left_behind() -> Iterator[None]:
+    """As by the removal of libauthz1-policy-file, which keeps its configuration."""
+    POLICY.parent.mkdir(exist_ok=True)
+    POLICY.write_text(role("root", "users=root", f"actions={ACTION_PREFIX}*"))
+    yield
+    POLICY.unlink()
+
+
+def test_policy_file_that_was_left_behind_decides_nothing(
+        policy_left_behind: None, real_service: Service, authz: FakeAuthz,
+        as_clerk: list[str]) -> None:
+    assert explain("GetUser")["reason"] == ALLOWED
+    assert explain("GetUser", wrapper=as_clerk)["reason"] == REFUSED
+
+    text = privanectl("explain", "GetUser", environment=authz.environment()).output
+    assert text.endswith("Allowed: yes (the authorization library allows it)\n")
+    authz.refuse("not for you")
+    text = privanectl("explain", "GetUser", environment=authz.environment()).output
+    assert "no (the authorization library refuses it: not for you)" in text
+    assert str(POLICY) not in text
 
 
 def test_library_that_is_not_there(real_service: Service, tmp_path: Path) -> None:

@@ -7,6 +7,7 @@ import pytest
 
 from harness.accounts import CLERK_UID, STRANGER_UID, replace
 from harness.bus import User
+from harness.fake_authz import FakeAuthz
 from harness.interface import ACTION_PREFIX
 from harness.policy_file import POLICY, policy, role
 from harness.privanectl import DONE, Run, as_user, privanectl
@@ -97,6 +98,28 @@ def test_broken_file_is_told(real_service: Service, as_clerk: list[str]) -> None
     told = explain("CheckUser", wrapper=as_clerk)
     assert told["allowed"] == "unknown"
     assert told["reason"].startswith(f"{POLICY} does not tell: {why}")
+
+
+def test_file_that_is_missing_decides_all_the_same(real_service: Service) -> None:
+    POLICY.unlink()
+    told = explain("CheckUser")
+
+    assert (told["allowed"], told["grant"]) == ("no", ROLE)
+    assert told["reason"].startswith(f"{REFUSED}: cannot check action {ACTION_PREFIX}checkuser: ")
+
+
+def test_library_of_the_devices_maker(real_service: Service, authz: FakeAuthz) -> None:
+    """The policy file is there, and it is not asked."""
+    def ask() -> tuple[str, str]:
+        told = privanectl("explain", "GetUser", "--json=short",
+                          environment=authz.environment()).json
+        return told["reason"], told["grant"]
+
+    authz.allow()
+    assert ask() == ("the authorization library allows it", None)
+    authz.refuse("not for you")
+    assert ask() == ("the authorization library refuses it: not for you",
+                     "what the device's own authorization library asks")
 
 
 def test_file_that_only_root_reads(real_service: Service, as_clerk: list[str]) -> None:

@@ -28,7 +28,7 @@ DEPENDS = {
 # Since when each symbol is there, and in which of the two packages of libauthz one is looked for.
 SYMBOLS = {
     "libauthz1-polkit": ["authz_check", "authz_init", "authz_release"],
-    "libauthz1-policy-file": ["authz_check", "authz_init", "authz_release"],
+    "libauthz1-policy-file": ["authz_check", "authz_init", "authz_policy_path", "authz_release"],
     "libbootparam1": ["bootparam_default_chip", "bootparam_read", "bootparam_set_chip",
                       "bootparam_write"],
     "libdigestentry1": ["digest_entry_delete", "digest_entry_delete_list", "digest_entry_set",

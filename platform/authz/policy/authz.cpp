@@ -11,6 +11,13 @@ static constexpr policy_places PLACES = {AUTHZ_POLICY_FILE, "/etc/passwd", "/etc
 
 static policy_store *kept_policy;
 
+// Exported, though no header has it and no other libauthz needs it: who has loaded a library, such
+// as privanectl, tells by it that this one decides, and by which file.
+extern "C" {
+[[gnu::visibility("default")]] extern const char authz_policy_path[];
+const char authz_policy_path[] = AUTHZ_POLICY_FILE;
+}
+
 // There is no service to be reached. A file that is missing or broken may be mended while the
 // program runs, and refuses everything until then.
 int authz_init(GError **) {
