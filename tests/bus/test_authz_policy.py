@@ -4,7 +4,6 @@ import os
 from typing import Iterator
 
 import pytest
-from gi.repository import GLib
 
 from harness.accounts import (CLERK_UID, STANDARD_GROUP, STANDARD_PASSWD, STANDARD_SHADOW,
                               VIEWER_ROLE_GID, AccountFiles, replace)
@@ -284,24 +283,15 @@ def test_caller_is_asked_about_once(real_service: Service, bus: Bus, clerk: User
     fresh.close()
 
 
-def match_rules(watcher: Bus, name: str) -> int:
-    """How many the connection has with the bus."""
-    (told,) = watcher.send("org.freedesktop.DBus", "/org/freedesktop/DBus",
-                           "org.freedesktop.DBus.Debug.Stats", "GetConnectionStats",
-                           GLib.Variant("(s)", (name,)))
-    return told["MatchRules"]
-
-
 def test_callers_who_are_gone_leave_no_match_rule(real_service: Service) -> None:
     """The bus lets a connection have 512, and each caller who is remembered takes one."""
     watcher = Bus()
-    name = watcher.owner()
-    at_rest = match_rules(watcher, name)
+    at_rest = watcher.match_rules()
     callers = [Bus() for _ in range(120)]
     assert [check_user(caller) for caller in callers] == [True] * len(callers)
-    assert match_rules(watcher, name) == at_rest + len(callers)
+    assert watcher.match_rules() == at_rest + len(callers)
     for caller in callers:
         caller.close()
-    wait_for("the end of the rules", lambda: match_rules(watcher, name) == at_rest)
+    wait_for("the end of the rules", lambda: watcher.match_rules() == at_rest)
     assert check_user(watcher) is True
     watcher.close()

@@ -131,9 +131,13 @@ PROOFS: tuple[Proof, ...] = (
           gate=368, step=368, aim=368, full=368, pace=0.15, patience=5),
     Proof("races", on_bus("races"), "trials",
           gate=5_000, step=5_000, aim=25_000, full=100_000, pace=0.02, patience=0.2),
+    Proof("races_policy_file", on_bus("races", "build", "--authz=policy-file"), "trials",
+          gate=500, step=2_500, aim=5_000, full=20_000, pace=0.025, patience=0.3),
     # The full amount takes 8 hours and 20 million calls, at the 530 a second that were measured.
     Proof("soak", on_bus("soak"), SECONDS,
           gate=60, step=1_800, aim=1_800, full=38_000, pace=1.05, patience=3, at_once=True),
+    Proof("soak_policy_file", on_bus("soak", "build", "--authz=policy-file"), SECONDS,
+          gate=25, step=600, aim=600, full=9_500, pace=1.1, patience=3, at_once=True),
     Proof("flood", on_bus("flood"), SECONDS,
           gate=10, step=20, aim=20, full=600, pace=16, patience=60, cores=2, at_once=True),
     Proof("flood_limited", on_bus("flood_limited", "build",

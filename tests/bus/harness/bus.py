@@ -123,6 +123,14 @@ class Bus:
     def pid_of(self, name: str) -> int:
         return self.ask_bus("GetConnectionUnixProcessID", "s", name)[0]
 
+    def match_rules(self, name: str = NAME) -> int:
+        """How many the connection has with the bus."""
+        (told,) = self.send("org.freedesktop.DBus", "/org/freedesktop/DBus",
+                            "org.freedesktop.DBus.Debug.Stats", "GetConnectionStats",
+                            GLib.Variant("(s)", (name,)))
+        rules: int = told["MatchRules"]
+        return rules
+
 
 class User:
     """A process of another user that makes calls when told to; harness/user_process.py."""

@@ -149,8 +149,8 @@ def call_and_vanish(call: Call, delay: float, bus: Bus, monitor: Record) -> bool
 def test_allowed_callers_that_vanish(stage: Stage, device: Device, monitor: Record,
                                      chance: random.Random, amount: int,
                                      figures: Counter[str]) -> None:
-    """A change is made wholly, with all that belongs to it, or not at all: where polkit does not
-    find the caller any more."""
+    """A change is made wholly, with all that belongs to it, or not at all: where the caller is
+    not found any more."""
     signature = next(method.signature for method in METHODS if method.member == "AddUser")
     wanted = share(amount, ALLOWED_SHARE)
     counts: Counter[str] = Counter()

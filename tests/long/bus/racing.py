@@ -1,7 +1,7 @@
 """tests/long/bus/racing.py: callers whose connections vanish, and what came of their calls.
 
-They are processes of clerk, who is in the group privane and has no role: polkit refuses whatever he
-asks for.
+They are processes of clerk, who is in the group privane and has no role: polkit, or the policy file,
+refuses whatever he asks for.
 """
 import json
 import subprocess

@@ -5,9 +5,10 @@
 64 connections call methods of every family for so many seconds, drop off in the middle of calls and
 come back. Meanwhile one of them adds, changes and removes accounts and groups, and the tools that
 the service runs fail, take their time, die of signals, print 10 MB, or hang. For a fifth of the
-time polkit decides. From the first fifth to the end the service is the same process with the same
-descriptors, no child left over, and less than 256 KiB larger; and the files hold what the calls
-made of them.
+time polkit decides; where a policy file does, that is for all of it, and 300 more connections come
+and go, whose answers have to follow the file as it changes. From the first fifth to the end the
+service is the same process with the same descriptors and as many match rules on the bus, no child
+left over, and less than 256 KiB larger; and the files hold what the calls made of them.
 
 It is looked at again and again when nobody calls, and after a call that is too large: the service
 gives freed memory back then, so that what is measured is what it holds.
@@ -35,6 +36,7 @@ from harness.service import Service
 from harness.stage import Stage
 from harness.syslog_socket import SyslogSocket
 from soak_callers import PATIENCE, Caller, Changer, Sandglass
+from soak_crowd import REMEMBERED, Crowd
 from soak_tools import TEN_MEGABYTES, SoakTools
 
 CONNECTIONS = 64
@@ -45,16 +47,22 @@ TOO_LARGE = 5 << 20
 # After the first fifth; a tool hangs after the first of them, and in a long run once more.
 LOOKS = 10
 LOOKS_BETWEEN_HANGS = 5
+LAST_LOOKS = 3
 LONG_SECONDS = 600
 HANG_SECONDS, LONG_HANG_SECONDS = 5, 20
 
 # A tool behaves in one way for so long.
 MANNERS_SECONDS = 0.5
 
+# Of the time; what a policy file decides has a start of its own.
+SHARES = {"allowed": 4 / 5, "polkit": 1 / 5, "policy_file": 1}
+
 # Each must come about, in both parts, the last one in the first of them; that is waited for when
 # the time is over.
 TRIED = ("calls", "errors", "changes", "disconnects", "tools_run", "tools_failed", "tools_hung")
 TRIED_ONCE = "tools_printed_10_mb"
+TRIED_BY_CROWD = ("visits", "policies_granting", "policies_withholding", "policies_renamed",
+                  "policies_edited")
 LAST_WAIT = 5 * PATIENCE
 
 
@@ -117,23 +125,39 @@ class Housekeeper(threading.Thread):
 
 
 class Soak:
-    """All that goes on at the same time."""
+    """All that goes on at the same time; with a crowd, which needs the group privane."""
 
     def __init__(self, stage: SoakedStage, modelled: ModelledStage, device: Device,
                  authz: FakeAuthz | OwnAuthz, chance: random.Random,
-                 is_with_polkit: bool) -> None:
+                 crowd_gid: int | None) -> None:
         self.pid = stage.service.pid
         self._bus = stage.bus
-        self._glass = Sandglass(CONNECTIONS)
-        self.callers = [Changer(self._glass, chance, modelled, not is_with_polkit),
+        self._glass = Sandglass(CONNECTIONS + (crowd_gid is not None))
+        all_are_allowed = isinstance(authz, FakeAuthz)
+        self.callers = [Changer(self._glass, chance, modelled, all_are_allowed),
                         *(Caller(self._glass, chance) for _ in range(CONNECTIONS - 1))]
         self._keeper = Housekeeper(self._glass, chance, stage, device, authz, self.callers[-1])
-        self.tried = TRIED if is_with_polkit else (*TRIED, TRIED_ONCE)
+        self._crowd = None if crowd_gid is None else Crowd(self._glass, chance, crowd_gid)
+        self.tried = (*TRIED, *((TRIED_ONCE,) if all_are_allowed else ()),
+                      *(TRIED_BY_CROWD if self._crowd else ()))
         self.counts: Counter[str] = Counter()
+
+    @property
+    def _counted(self) -> list[Caller | Crowd | SoakTools]:
+        return [*self.callers, self._keeper.tools, *([self._crowd] if self._crowd else [])]
 
     def run(self, seconds: float) -> list[dict[str, int]]:
         """What was seen after each part of the time, first after a fifth of it."""
-        threads = (*self.callers, self._keeper)
+        try:
+            if self._crowd:
+                self._crowd.visit()  # The largest, so that no later one is the first.
+            return self._run(seconds)
+        finally:
+            if self._crowd:
+                self._crowd.close()
+
+    def _run(self, seconds: float) -> list[dict[str, int]]:
+        threads = (*self.callers, self._keeper, *([self._crowd] if self._crowd else []))
         looks: list[dict[str, int]] = []
         for thread in threads:
             thread.start()
@@ -157,12 +181,18 @@ class Soak:
     def _look(self, seconds: float, looks: list[dict[str, int]]) -> None:
         is_long = seconds > LONG_SECONDS
         self._glass.is_over.wait(seconds / 5)
-        looks.append(self._glass.paused(lambda: held(self._bus, self.pid)))
+        looks.append(self._glass.paused(self._held))
         for number in range(LOOKS):
             if number == 0 or is_long and number % LOOKS_BETWEEN_HANGS == 0:
                 self._keeper.make_hang(LONG_HANG_SECONDS if is_long else HANG_SECONDS)
             self._glass.is_over.wait(seconds * 4 / 5 / LOOKS)
-            looks.append(self._glass.paused(lambda: held(self._bus, self.pid)))
+            looks.append(self._glass.paused(self._held))
+
+    def _held(self) -> dict[str, int]:
+        # Those are remembered who have called since they came.
+        for caller in self.callers:
+            assert caller.bus.call("CheckUser", "s", "root", timeout=PATIENCE) == (True,)
+        return held(self._bus, self.pid)
 
     def _is_all_tried(self) -> bool:
         return not self._keeper.awaits_hang and not self._missing()
@@ -170,7 +200,7 @@ class Soak:
     def _missing(self) -> list[str]:
         """What has not come about yet."""
         seen: Counter[str] = Counter()
-        for source in (*self.callers, self._keeper.tools):
+        for source in self._counted:
             seen.update(dict(source.counts))
         return [name for name in self.tried if not seen[name]]
 
@@ -179,7 +209,7 @@ class Soak:
         return max(caller.longest_wait for caller in self.callers)
 
     def add_to(self, figures: Counter[str]) -> None:
-        for source in (*self.callers, self._keeper.tools):
+        for source in self._counted:
             self.counts.update(source.counts)
         longest = {name: self.counts[name] for name in self.counts if name.startswith("max_")}
         figures.update(self.counts - Counter(longest))
@@ -198,12 +228,16 @@ def held(bus: Bus, pid: int) -> dict[str, int]:
     return {"kib": int(fields["VmRSS"].split()[0]), "peak": int(fields["VmHWM"].split()[0]),
             "heap": int(fields["RssAnon"].split()[0]),
             "descriptors": len(os.listdir(f"/proc/{pid}/fd")),
+            "match_rules": bus.match_rules(),
             "children": len(process.children(pid))}
 
 
-@pytest.fixture(params=["allowed", "polkit"])
+# What allows everything is the same beside each of our own libraries, and soaked beside one.
+@pytest.fixture(params=[pytest.param("allowed", marks=pytest.mark.polkit),
+                        pytest.param("polkit", marks=pytest.mark.polkit),
+                        pytest.param("policy_file", marks=pytest.mark.policy_file)])
 def decider(request: pytest.FixtureRequest, authz: FakeAuthz) -> FakeAuthz | OwnAuthz:
-    return OwnAuthz() if request.param == "polkit" else authz
+    return authz if request.param == "allowed" else OwnAuthz()
 
 
 @pytest.fixture
@@ -222,31 +256,42 @@ def soaked(changing_accounts: AccountFiles, device: Device,
 
 def test_soak(soaked: SoakedStage, request: pytest.FixtureRequest, accounts: AccountFiles,
               device: Device, decider: FakeAuthz | OwnAuthz, bus: Bus, amount: int,
-              chance: random.Random, figures: Counter) -> None:
+              privane_gid: int, chance: random.Random, figures: Counter) -> None:
     part = request.node.callspec.params["decider"]
-    is_with_polkit = part == "polkit"
-    seconds = amount / 5 if is_with_polkit else amount * 4 / 5
+    is_with_crowd = part == "policy_file"
+    seconds = amount * SHARES[part]
     modelled = ModelledStage(soaked, accounts)
     soaked.wire.close()
     # The largest answer, so that no later one is the first.
     device.tools[LLDPCLI].print(TEN_MEGABYTES)
     for _ in range(3):
         bus.call("ExecuteLldpcli", "s", "show-neighbors", timeout=PATIENCE)
-    soak = Soak(soaked, modelled, device, decider, chance, is_with_polkit)
+    rules = bus.match_rules()
+    soak = Soak(soaked, modelled, device, decider, chance, privane_gid if is_with_crowd else None)
     begin = time.monotonic()
     looks = soak.run(seconds)
     taken = int(time.monotonic() - begin)
     figures["seconds"] += taken
     soak.add_to(figures)
-    growth = max(look["kib"] for look in looks) - looks[0]["kib"]
+    sizes = [look["kib"] for look in looks]
+    # With a crowd one look may find half a MiB more than those after it; what is kept for good is in
+    # all of them.
+    growth = (min(sizes[-LAST_LOOKS:]) if is_with_crowd else max(sizes)) - sizes[0]
     # Each part is one process: how long it ran, how much it grew, and the most that it ever held.
     figures[f"max_seconds_{part}"] = taken
     figures[f"max_growth_kib_{part}"] = growth
     figures[f"max_resident_kib_{part}"] = looks[-1]["peak"]
     figures["looks"] += len(looks)
-    print(f"\n{request.node.name}: {dict(figures)}\n{looks[0]}\n{looks[-1]}", flush=True)
+    print(f"\n{request.node.name}: {dict(figures)}\n{looks[0]}\n{looks[-1]}\n{sizes} KiB",
+          flush=True)
     assert soaked.service.is_running() and soaked.service.pid == soak.pid
     assert len(looks) == LOOKS + 1
+    # A caller who is remembered takes one.
+    rules += CONNECTIONS if is_with_crowd else 0
+    assert {look["match_rules"] for look in looks} == {rules}, looks
+    if is_with_crowd:
+        # One more while room is made.
+        assert soak.counts["max_match_rules"] in (REMEMBERED, REMEMBERED + 1), soak.counts
     assert growth < GROWTH_KIB, looks
     assert {look["descriptors"] for look in looks} == {looks[0]["descriptors"]}, looks
     assert not any(look["children"] for look in looks), looks

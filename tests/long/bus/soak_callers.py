@@ -53,6 +53,10 @@ class Sandglass:
             self._barrier.wait(PATIENCE)
             self._barrier.wait(PATIENCE)
 
+    def is_pausing(self) -> bool:
+        """Whether a pause has begun, or waits for all callers."""
+        return self._is_paused.is_set()
+
     def paused(self, look: Callable[[], Any]) -> Any:
         """What is seen while nobody calls."""
         self._is_paused.set()
@@ -134,8 +138,8 @@ class Caller(threading.Thread):
 
 
 class Changer(Caller):
-    """The one that changes accounts, each change as the model has it. polkit refuses who is gone,
-    if he is by then; so it drops off only where his call counts all the same."""
+    """The one that changes accounts, each change as the model has it. Who is gone is refused by our
+    own libauthz, if he is by then; so it drops off only where his call counts all the same."""
 
     def __init__(self, glass: Sandglass, chance: random.Random, modelled: ModelledStage,
                  may_drop_off: bool) -> None:

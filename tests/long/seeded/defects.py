@@ -72,6 +72,9 @@ DEFECTS = (
     Defect("vanished-caller-allowed.patch", Start("races", 250),
            r"^E +assert World\(.*\) == World\("),
     Defect("leaked-descriptor.patch", Start("soak", 60), r"^> +assert .*descriptors"),
+    # Of who was asked about long ago, and of who is gone.
+    Defect("kept-watch.patch", Start("soak_policy_file", 25), r"^> +assert .*match_rules"),
+    Defect("kept-credentials.patch", Start("soak_policy_file", 25), r"^> +assert growth < "),
     # How long anybody waits depends on the machine; how much is held does not.
     Defect("no-intake-limit.patch", Start("flood", 2, ("-k", "[lists]")), r"^> +assert peak <= "),
     Defect("no-intake-limit.patch", Start("flood_limited", 2, ("-k", "[lists]")), r"^> +assert peak <= "),
