@@ -146,7 +146,7 @@ PROOFS: tuple[Proof, ...] = (
     Proof("daemon_secrets", on_bus("daemon_secrets"), "calls",
           gate=400, step=2_000, aim=2_000, full=20_000, pace=0.03, patience=3),
     Proof("seeded_defects", ("tests/long/seeded/run",), "defects",
-          gate=8, step=20, aim=20, full=20, pace=35, patience=600, cores=2),
+          gate=8, step=22, aim=22, full=22, pace=28, patience=600, cores=2),
 )
 
 
