@@ -30,6 +30,8 @@ pytestmark = pytest.mark.policy_file
 
 # For what the bus has sent to be in the service's socket.
 DELIVERY_SECONDS = 0.1
+# For a service that gets next to nothing of the processor.
+PATIENCE_SECONDS = 60
 
 
 (CHECK_USER,) = (method for method in METHODS if method.member == "CheckUser")
@@ -145,8 +147,11 @@ def slow_bus(table: Table, method: Method) -> Answer:
         time.sleep(DELIVERY_SECONDS)
         os.kill(daemon, signal.SIGSTOP)
     # A service that got little of the processor has asked late, and must not be answered after all.
-    wait_for("the end of the wait", lambda: refusals() > told)
-    os.kill(daemon, signal.SIGCONT)
+    try:
+        wait_for("the end of the wait", lambda: refusals() > told,
+                 PATIENCE_SECONDS)
+    finally:
+        os.kill(daemon, signal.SIGCONT)
     exchange([caller], [], lambda _, answer: answers.append(answer))
     caller.close()
     (answer,) = answers
