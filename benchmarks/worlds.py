@@ -146,10 +146,12 @@ def ext4_folder(disk: Path) -> Iterator[tuple[Path, str]]:
                           check=True).stdout.strip()
     if kind == "ext4":
         folder = disk / "worlds"
-        shutil.rmtree(folder, ignore_errors=True)  # of a run that was ended
-        folder.mkdir()
-        yield folder, "ext4 on the disk"
-        shutil.rmtree(folder)
+        shutil.rmtree(folder, ignore_errors=True)  # of a run that was killed
+        folder.mkdir(mode=0o700)  # the worlds are made from this machine's /etc
+        try:
+            yield folder, "ext4 on the disk"
+        finally:
+            shutil.rmtree(folder)
         return
     image, target = disk / "ext4.img", Path("/tmp/ext4")
     _make_ext4(image)
