@@ -6,6 +6,7 @@ import random
 import subprocess
 import threading
 from collections import Counter
+from contextlib import suppress
 from pathlib import Path
 from typing import Callable
 
@@ -60,12 +61,16 @@ class Group:
 
     def heard(self) -> Counter[str]:
         assert self._process.stdout is not None
-        return Counter(json.loads(self._process.stdout.readline()))
+        line = self._process.stdout.readline()
+        assert line, f"the crowd of {self.uid} has ended with {self._process.wait(PATIENCE)}"
+        return Counter(json.loads(line))
 
-    def close(self) -> None:
+    def close(self) -> int:
+        """The status that it ends with."""
         assert self._process.stdin is not None
-        self._process.stdin.close()
-        assert self._process.wait(PATIENCE) == 0
+        with suppress(BrokenPipeError):
+            self._process.stdin.close()
+        return self._process.wait(PATIENCE)
 
 
 class Crowd(threading.Thread):
@@ -94,8 +99,7 @@ class Crowd(threading.Thread):
     def close(self) -> None:
         replace(POLICY, self._packaged, 0o644, 0)
         self._bus.close()
-        for group in self._groups:
-            group.close()
+        assert [group.close() for group in self._groups] == [0] * len(self._groups)
 
     def visit(self) -> None:
         """Under one policy at least; under no more where others wait for the crowd to leave."""
