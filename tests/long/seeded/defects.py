@@ -61,7 +61,7 @@ DEFECTS = (
     # The caller who was asked about first is root.
     Defect("credentials-of-another.patch",
            Start("policy_matrix", 46, ("-k", "test_refused")),
-           r"^E +assert None == BusError\(.* is refused to uid "),
+           r"^expected = BusError\(.* is refused to uid "),
     # The last of the files is new, and those before it are not.
     Defect("reversed-renames.patch", Start("daemon_kills", 60),
            r"^E +against version \d+:\nE +/etc/group: "),
