@@ -1,4 +1,6 @@
 """tests/packages/test_contents.py: every file of every package, and who may write it."""
+import os
+import subprocess
 from pathlib import Path
 
 import pytest
@@ -99,6 +101,27 @@ def test_scripts(packages: dict[str, Deb], tmp_path: Path) -> None:
     assert scripts == {("privane-system", "postinst"), ("privane-system", "prerm"),
                        ("privane-system", "postrm"), ("libparamcli1", "postrm"),
                        ("libdigestentry1", "postrm")}
+
+
+@pytest.mark.parametrize(("name", "files"), [
+    ("libparamcli1", ("etc/privane/parameters.conf", "etc/privane/parameters.conf.lock")),
+    ("libdigestentry1", ("etc/apache2/digest_auth_passwd.lock",))])
+def test_what_another_architectures_copy_uses_is_kept(name: str, files: tuple[str, ...],
+                                                      packages: dict[str, Deb], tmp_path: Path) -> None:
+    """dpkg tells the scripts how many architectures of a package there are."""
+    script = packages[name].control(tmp_path)["postrm"]
+
+    def purge(copies: int) -> list[bool]:
+        for file in files:
+            (tmp_path / file).parent.mkdir(parents=True, exist_ok=True)
+            (tmp_path / file).touch()
+        subprocess.run(["sh", "-c", script, "sh", "purge"], check=True,
+                       env={**os.environ, "DPKG_ROOT": str(tmp_path),
+                            "DPKG_MAINTSCRIPT_PACKAGE_REFCOUNT": str(copies)})
+        return [(tmp_path / file).exists() for file in files]
+
+    assert purge(2) == [True] * len(files)
+    assert purge(1) == [False] * len(files)
 
 
 def test_accounts_are_nobodys_to_remove(packages: dict[str, Deb], tmp_path: Path) -> None:
