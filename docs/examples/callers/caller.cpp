@@ -51,12 +51,15 @@ static bool list_users(PrivaneSystem *service, GError **error) {
     return true;
 }
 
-// A password that is wiped when it is no longer needed.
+// A password whose text is wiped. What was read with it stays in the stream's buffer.
 struct password_line {
     std::string text;
 
     // The first line of standard input, which no other user can see, as an argument could be.
-    password_line() { std::getline(std::cin, text); }
+    password_line() {
+        text.reserve(1024);  // A text that has to grow leaves its beginning behind.
+        std::getline(std::cin, text);
+    }
     ~password_line() { explicit_bzero(text.data(), text.size()); }
     password_line(const password_line &) = delete;
     password_line &operator=(const password_line &) = delete;
