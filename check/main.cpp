@@ -169,6 +169,8 @@ int main(int argc, char **argv) {
         return WRONG_CALL;
     }
     const mount_points mounts(chosen.root);
+    // What turns messages into UTF-8 is loaded by the first one, and must not come from the image.
+    (void)g_strerror(EINVAL);
     if (chosen.root != nullptr && (chroot(chosen.root) != 0 || chdir("/") != 0)) {
         (void)std::fprintf(stderr, "privane-check: %s: %m\n", chosen.root);
         return WRONG_CALL;

@@ -160,6 +160,26 @@ def test_a_link_leads_out_of_no_image(tmp_path: Path) -> None:
     assert done.returncode == UNUSABLE
 
 
+def test_no_code_of_an_image_is_run(tmp_path: Path) -> None:
+    """The C library converts messages by modules, which it would look for in the image."""
+    (tmp_path / "etc").mkdir()
+    for path in (PASSWD, GROUP):
+        shutil.copy2(path, tmp_path / "etc")
+    (tmp_path / "etc/shadow").symlink_to("shadow")
+    for folder in ("usr/lib/gconv", "usr/lib64/gconv", f"usr/lib/{os.uname().machine}-linux-gnu/gconv"):
+        (tmp_path / folder).mkdir(parents=True)
+        (tmp_path / folder / "gconv-modules").write_text("module ANSI_X3.4-1968// INTERNAL NOSUCH 1\n"
+                                                         "module INTERNAL ANSI_X3.4-1968// NOSUCH 1\n")
+    done = subprocess.run(["strace", "-e", "trace=chroot,openat,open", "/usr/sbin/privane-check",
+                           "--json=short", f"--root={tmp_path}"], capture_output=True, text=True,
+                          check=False)
+    before, chroot, inside = done.stderr.partition(f'chroot("{tmp_path}") ')
+    assert "gconv" in before and chroot
+    assert "exited with 4" in inside and "gconv" not in inside
+    texts = {found["kind"]: found["text"] for found in json.loads(done.stdout)["findings"]}
+    assert texts["unreadable"] == "Too many levels of symbolic links"
+
+
 def test_json_is_valid_whatever_a_name_holds() -> None:
     write(GOOD_PASSWD + "a\x1fb\u009bc:*:70000:100::/:/bin/sh\n")
     done = check("--json=short")
