@@ -21,7 +21,7 @@ std::string_view account_line::field(std::size_t index) const {
     for (; index > 0; index--) {
         const std::size_t end = end_of_field(rest);
         if (end == rest.size())
-            return {};
+            return rest.substr(end);
         rest.remove_prefix(end + 1);
     }
     return rest.substr(0, end_of_field(rest));

@@ -7,6 +7,7 @@
 #include <span>
 
 #include "check/hash_cost.h"
+#include "check/repeated_lines.h"
 #include "usermgmt/account_types.h"
 
 static constexpr std::size_t PASSWORD = 1, MEMBERS = 3, FIRST_AGE = 3;
@@ -43,6 +44,7 @@ class line_review {
         : files_(files), ctx_(ctx), out_(out) {}
     ~line_review() {
         g_hash_table_unref(shadowed_);
+        g_hash_table_unref(due_);
         g_hash_table_unref(users_);
         g_hash_table_unref(shadow_names_);
     }
@@ -58,21 +60,26 @@ class line_review {
     void review_malformed(int row, const account_line &line);
     void review_passwd();
     void review_shadow();
+    void review_added_shadow_lines();
     void review_order();
     void review_groups();
+    void expect_shadow_line(const internal_user *user);
+    bool take_shadow_line(const char *name);
     void explain_lost_user(const account_line &line);
     void explain_lost_group(const account_line &line);
     void compare(int row, const account_line &line, const void *record);
     void review_members(const account_line &line);
-    void review_twice(int row, const char *what);
     void review_hash(int row, const account_line &line);
     void review_root();
 
     const account_file (&files_)[CORE_FILE_COUNT];
     const usermgmt_ctx *ctx_;
     findings *out_;
-    GHashTable *shadowed_ = name_table_new();  // the users that keep a line in the shadow file
-    GHashTable *users_ = name_table_new();     // those with a line in passwd
+    // Of the users that have lines in the shadow file once it is written: one of that name (all
+    // have the same line), and how many lines are to come.
+    GHashTable *shadowed_ = name_table_new();
+    GHashTable *due_ = name_table_new();
+    GHashTable *users_ = name_table_new();  // those with a line in passwd
     GHashTable *shadow_names_ = name_table_new();
 };
 
@@ -241,10 +248,27 @@ void line_review::review_passwd() {
             continue;
         }
         if (user->shadowed)
-            (void)add_name(shadowed_, user->name);  // Likewise.
+            expect_shadow_line(user);
         compare(CORE_FILE_ROW_PASSWD, *line, user);
         review_hash(CORE_FILE_ROW_PASSWD, *line);
     }
+}
+
+void line_review::expect_shadow_line(const internal_user *user) {
+    const guint due = GPOINTER_TO_UINT(g_hash_table_lookup(due_, user->name));
+
+    (void)g_hash_table_insert(shadowed_, user->name, const_cast<internal_user *>(user));
+    (void)g_hash_table_insert(due_, user->name, GUINT_TO_POINTER(due + 1));
+}
+
+// False where all that are to come were taken.
+bool line_review::take_shadow_line(const char *name) {
+    const guint due = GPOINTER_TO_UINT(g_hash_table_lookup(due_, name));
+
+    if (due == 0)
+        return false;
+    (void)g_hash_table_insert(due_, const_cast<char *>(name), GUINT_TO_POINTER(due - 1));
+    return true;
 }
 
 void line_review::review_shadow() {
@@ -254,13 +278,14 @@ void line_review::review_shadow() {
     for (const account_line *line : lines_of(files_[ROW])) {
         if (!line->is_entry)
             continue;
-        if (!add_name(seen, line->name)) {
+        const bool is_first = add_name(seen, line->name);
+        if (take_shadow_line(line->name)) {
+            compare(ROW, *line, g_hash_table_lookup(shadowed_, line->name));
+            review_hash(ROW, *line);
+        } else if (!is_first) {
             add(gravity::CHANGE, "repeated-shadow-line", ROW, *line,
                 g_strdup("a write drops this line: the user stands in an earlier one, which "
                          "counts"));
-        } else if (has_name(shadowed_, line->name)) {
-            compare(ROW, *line, user_database_find(&ctx_->user_db, line->name));
-            review_hash(ROW, *line);
         } else if (!has_name(users_, line->name)) {
             add(gravity::CHANGE, "no-passwd-line", ROW, *line,
                 g_strdup("a write drops this line: no user has this name"));
@@ -269,6 +294,16 @@ void line_review::review_shadow() {
                 g_strdup("a write drops this line: the user's password stands in passwd"));
         }
     }
+}
+
+// Each user of a name that stands twice is written with a line of its own.
+void line_review::review_added_shadow_lines() {
+    for (const internal_user *user : records<const internal_user>(ctx_->user_db.entries))
+        if (user->shadowed && take_shadow_line(user->name))
+            out_->add(gravity::CHANGE, "added-shadow-line",
+                      core_file_table[CORE_FILE_ROW_SHADOW].path, 0, user->name,
+                      g_strdup("a write adds a line of the user, whose name stands twice in "
+                               "passwd"));
 }
 
 // The lines of the shadow file follow those of passwd once they are written.
@@ -290,7 +325,7 @@ void line_review::review_order() {
         at++;
     }
     if (!is_same || at != names->len)
-        out_->add(gravity::NOTICE, "order", core_file_table[CORE_FILE_ROW_SHADOW].path, 0, nullptr,
+        out_->add(gravity::CHANGE, "order", core_file_table[CORE_FILE_ROW_SHADOW].path, 0, nullptr,
                   g_strdup("its lines stand in another order than those of passwd, which a write "
                            "gives them"));
 }
@@ -320,37 +355,6 @@ void line_review::review_groups() {
     }
 }
 
-// The line that has the key first, or null where this one has.
-static const account_line *find_first(GHashTable *lines, const void *key,
-                                      const account_line *line) {
-    auto *mutable_key = const_cast<void *>(key);
-    const auto *first = static_cast<const account_line *>(g_hash_table_lookup(lines, key));
-
-    if (first == nullptr)
-        (void)g_hash_table_insert(lines, mutable_key, const_cast<account_line *>(line));
-    return first;
-}
-
-// Names and IDs that stand twice are kept, but an operation finds only one of them.
-void line_review::review_twice(int row, const char *what) {
-    g_autoptr(GHashTable) by_name = name_table_new();
-    g_autoptr(GHashTable) by_id = g_hash_table_new(g_direct_hash, g_direct_equal);
-
-    for (const account_line *line : lines_of(files_[row])) {
-        if (!line->is_entry)
-            continue;
-        const account_line *named = find_first(by_name, line->name, line);
-        if (named != nullptr && row == CORE_FILE_ROW_PASSWD)
-            add(gravity::NOTICE, "repeated-name", row, *line,
-                g_strdup_printf("has the name of line %u; a change reaches the last of them",
-                                named->number));
-        const account_line *numbered = find_first(by_id, GUINT_TO_POINTER(line->id), line);
-        if (numbered != nullptr)
-            add(gravity::NOTICE, "repeated-id", row, *line,
-                g_strdup_printf("has the %s of line %u", what, numbered->number));
-    }
-}
-
 void line_review::review_hash(int row, const account_line &line) {
     const std::string_view hash = line.field(PASSWORD);
     const bool is_known = find_hash_cost(hash).work != hash_work::UNKNOWN;
@@ -376,10 +380,10 @@ void line_review::run() {
         review_others(row);
     review_passwd();
     review_shadow();
+    review_added_shadow_lines();
     review_order();
     review_groups();
-    review_twice(CORE_FILE_ROW_PASSWD, "UID");
-    review_twice(CORE_FILE_ROW_GROUP, "GID");
+    review_repeated_lines(files_, out_);
     review_root();
 }
 

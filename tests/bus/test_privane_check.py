@@ -92,6 +92,9 @@ SHADOW_CASES = {
     "ageing": (GOOD_SHADOW.replace(":19000:0:99999:7:0::\n", ":19000:5:99999:7:::\n", 1),
                ["1: change: ageing: 'root': the minimum age \"5\" becomes \"0\"; the inactivity "
                 "period \"\" becomes \"0\""]),
+    "a line of the old form": (GOOD_SHADOW.replace("99999:7:0::\n", "99999\n", 1),
+                               ["1: change: ageing: 'root': the warning period \"\" becomes \"7\"; "
+                                "the inactivity period \"\" becomes \"0\""]),
     "no-passwd-line": (GOOD_SHADOW + "ghost:*:1:0:99999:7:0::\n",
                        ["3: change: no-passwd-line: 'ghost': a write drops this line: no user has "
                         "this name"]),
@@ -119,9 +122,9 @@ def test_a_shadow_line_of_a_password_in_passwd() -> None:
 def test_shadow_lines_in_another_order() -> None:
     write(shadow="".join(reversed(GOOD_SHADOW.splitlines(keepends=True))))
     done = check()
-    assert done.stdout == ("/etc/shadow: notice: order: its lines stand in another order than those "
+    assert done.stdout == ("/etc/shadow: change: order: its lines stand in another order than those "
                            "of passwd, which a write gives them\n")
-    assert done.returncode == NOTHING
+    assert done.returncode == CHANGES
 
 
 GROUP_CASES = {
@@ -167,7 +170,7 @@ def test_of_two_lines_of_a_user_the_one_that_is_kept_is_told_apart() -> None:
         "/etc/passwd:3: loss: no-primary-group: 'bob': a write drops the user: no group that is kept "
         "has its GID 4242",
         "/etc/passwd:4: notice: repeated-name: 'bob': has the name of line 3; a change reaches the "
-        "last of them",
+        "last of them, a check of a password the first",
         "/etc/passwd:4: notice: repeated-id: 'bob': has the UID of line 3"]
 
 
@@ -183,10 +186,38 @@ def test_as_many_users_as_there_can_be() -> None:
     assert time.monotonic() - begin < 10
 
 
+TWICE = ("/etc/passwd:3: notice: repeated-name: 'alice': has the name of line 2; a change reaches the last "
+         "of them, a check of a password the first")
+SECOND_ALICE = GOOD_PASSWD + "alice:x:1002:100::/:/bin/sh\n"
+ALICES_LINE = GOOD_SHADOW.splitlines(keepends=True)[1]
+
+
 def test_a_name_that_stands_twice() -> None:
-    write(GOOD_PASSWD + "alice:x:1002:100::/:/bin/sh\n")
-    assert told() == ["/etc/passwd:3: notice: repeated-name: 'alice': has the name of line 2; a "
-                      "change reaches the last of them"]
+    """Each of the two is written with a shadow line."""
+    write(SECOND_ALICE)
+    done = check()
+    assert done.stdout.splitlines() == [
+        TWICE, "/etc/shadow: change: added-shadow-line: 'alice': a write adds a line of the user, whose "
+        "name stands twice in passwd"]
+    assert done.returncode == CHANGES
+
+
+def test_a_name_that_stands_twice_in_both_files() -> None:
+    write(SECOND_ALICE, GOOD_SHADOW + ALICES_LINE)
+    done = check()
+    assert (done.stdout.splitlines(), done.returncode) == ([TWICE], NOTHING)
+
+    write(SECOND_ALICE, GOOD_SHADOW + ALICES_LINE.replace("salt", "other") + ALICES_LINE)
+    assert told() == [
+        TWICE, "/etc/shadow:3: change: fields: 'alice': the password field becomes another",
+        "/etc/shadow:4: change: repeated-shadow-line: 'alice': a write drops this line: the user stands "
+        "in an earlier one, which counts"]
+
+
+def test_a_shadow_line_is_of_the_name_that_needs_it() -> None:
+    """The last of two has its password in passwd."""
+    write(GOOD_PASSWD + "alice:*:1002:100::/:/bin/sh\n")
+    assert told() == [TWICE]
 
 
 def test_a_record_that_cannot_be_written() -> None:
