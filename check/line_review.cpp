@@ -8,6 +8,7 @@
 
 #include "check/hash_cost.h"
 #include "check/repeated_lines.h"
+#include "check/unfinished_addition.h"
 #include "usermgmt/account_types.h"
 
 static constexpr std::size_t PASSWORD = 1, MEMBERS = 3, FIRST_AGE = 3;
@@ -188,7 +189,13 @@ void line_review::compare(int row, const account_line &line, const void *record)
 void line_review::explain_lost_user(const account_line &line) {
     static constexpr int ROW = CORE_FILE_ROW_PASSWD;
 
-    if (line.field(PASSWORD) == ELSEWHERE && !has_name(shadow_names_, line.name))
+    const bool lacks_shadow_line =
+        line.field(PASSWORD) == ELSEWHERE && !has_name(shadow_names_, line.name);
+    if (lacks_shadow_line && is_unfinished_addition(files_, line))
+        add(gravity::CHANGE, "unfinished-addition", ROW, line,
+            g_strdup("a write drops this line: the user's addition was cut off before there was a "
+                     "line in the shadow file, and can be made again"));
+    else if (lacks_shadow_line)
         add(gravity::LOSS, "no-shadow-line", ROW, line,
             g_strdup("a write drops the user: its password is in the shadow file, which has no "
                      "line of it"));

@@ -28,3 +28,16 @@ def test_a_device_that_would_lose_an_account(camera: Camera) -> None:
     camera.run(["systemctl", "restart", UNIT]).check()
     wait_for_owner(camera)
     assert ask(camera, "CheckUser", "'human'") == (False,)
+
+
+def test_an_addition_that_a_crash_cut_off(camera: Camera) -> None:
+    """It was answered to nobody, and keeps the service from nothing."""
+    camera.run("echo 'half:x:1500:100::/home:/bin/false' >>/etc/passwd && "
+               "cp /etc/shadow /etc/shadow.tmp").check()
+    camera.run(["systemctl", "restart", UNIT]).check()
+    wait_for_owner(camera)
+    assert ask(camera, "CheckUser", "'half'") == (False,)
+    camera.run(["rm", "/etc/shadow.tmp"]).check()
+    camera.run(f"systemctl restart {UNIT}")
+    assert unit_properties(camera, "ActiveState", "Result") == {
+        "ActiveState": "inactive", "Result": "exec-condition"}

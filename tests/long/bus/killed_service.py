@@ -9,6 +9,7 @@ from harness.account_rules import digest_line
 from harness.accounts import AccountFiles
 from harness.bus import Bus, BusError, domain_error
 from harness.changing_accounts import write_changing_accounts
+from harness.checker import NOTHING, check
 from harness.fake_authz import FakeAuthz
 from harness.interface import METHODS
 from harness.passwords import OLD
@@ -70,7 +71,9 @@ class KilledService:
         self.access = Access()
 
     def start(self) -> None:
-        """It owns its name afterwards."""
+        """It owns its name afterwards. The unit asks the checker first."""
+        asked = check("--guard")
+        assert (asked.returncode, asked.stdout, asked.stderr) == (NOTHING, "", "")
         self.syslog.forget()
         self.service = self._start(environment=self._environment)
         self.service.wait_registered(self.bus)

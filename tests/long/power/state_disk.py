@@ -15,6 +15,8 @@ from recovery import faults_of_recovery
 PATHS = {
     "passwd": "/etc/passwd", "shadow": "/etc/shadow", "group": "/etc/group",
     "digest": "/etc/apache2/digest_auth_passwd", "parameters": "/etc/privane/parameters.conf"}
+# What a write renames over the account files, whole or not.
+TEMPORARIES = {f"{name}.tmp": f"{PATHS[name]}.tmp" for name in ("passwd", "shadow", "group")}
 TOOL_SECONDS = 60
 # One state of so many is mounted by the kernel as well.
 STATES_TO_A_MOUNT = 20
@@ -44,7 +46,11 @@ class StateDisk:
         self._mount_point = folder / "mount-point"
         self._mount_point.mkdir()
         self._commands = folder / "commands"
-        self._commands.write_text("".join(f"stat {path}\ncat {path}\n" for path in PATHS.values()))
+        self._dumped = folder / "temporaries"
+        self._dumped.mkdir()
+        self._commands.write_text(
+            "".join(f"dump {path} {self._dumped / name}\n" for name, path in TEMPORARIES.items())
+            + "".join(f"stat {path}\ncat {path}\n" for path in PATHS.values()))
         self._applied = 0
 
     def left_by(self, state: State) -> Version:
@@ -59,6 +65,10 @@ class StateDisk:
         parameters = active_parameters(boot)
         version["boot"] = None if parameters is None else (0, 0, 0, parameters)
         return version
+
+    def temporaries(self) -> dict[str, bytes]:
+        """The contents of those that the newest state has."""
+        return {path.name: path.read_bytes() for path in self._dumped.iterdir()}
 
     def _make(self, state: State) -> bytes:
         """Returns the boot block's copies, which need no recovery."""
@@ -110,6 +120,8 @@ class StateDisk:
                                    f"{done.stdout.decode(errors='replace')[-600:]}")
 
     def _read_files(self) -> Version:
+        for old in self._dumped.iterdir():
+            old.unlink()
         done = _tool("debugfs", "-f", self._commands, self._path)
         if done.returncode != 0:
             raise BrokenFileSystem(f"debugfs: {done.stderr.decode(errors='replace')[-600:]}")

@@ -34,6 +34,7 @@ def disk_image(tmp_path_factory: pytest.TempPathFactory) -> bytes:
         path.parent.mkdir(parents=True, exist_ok=True)
         path.write_bytes(content)
         path.chmod(0o640 if name == "shadow" else 0o644)
+    (folder / "root/etc/shadow.tmp").write_bytes(b"left by a crash")
     image = folder / "disk"
     subprocess.run(["mkfs.ext4", "-q", "-b", "4096", "-d", folder / "root", image,
                     f"{FILE_SYSTEM_SIZE >> 10}k"], env=ENVIRONMENT, check=True)
@@ -67,6 +68,7 @@ def test_the_files_of_a_state(disk: StateDisk) -> None:
                     "shadow": (0o640, *owner, CONTENT["shadow"]),
                     "group": (0o644, *owner, b""), "digest": None, "parameters": None,
                     "boot": (0, 0, 0, b"A=1")}
+    assert disk.temporaries() == {"shadow.tmp": b"left by a crash"}
 
 
 def test_extra_writes_are_of_this_state_only(disk: StateDisk) -> None:
