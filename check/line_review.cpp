@@ -2,7 +2,6 @@
 #include "check/line_review.h"
 
 #include <cerrno>
-#include <cstring>
 #include <iterator>
 #include <span>
 
@@ -33,6 +32,19 @@ static bool has_name(GHashTable *names, const char *name) {
     return g_hash_table_contains(names, name) == TRUE;
 }
 
+static void count_one(GHashTable *counts, const char *name) {
+    const guint count = GPOINTER_TO_UINT(g_hash_table_lookup(counts, name));
+    (void)g_hash_table_insert(counts, const_cast<char *>(name), GUINT_TO_POINTER(count + 1));
+}
+
+// False where none is left.
+static bool take_one(GHashTable *counts, const char *name) {
+    const guint count = GPOINTER_TO_UINT(g_hash_table_lookup(counts, name));
+    if (count > 0)
+        (void)g_hash_table_insert(counts, const_cast<char *>(name), GUINT_TO_POINTER(count - 1));
+    return count > 0;
+}
+
 // False where it was there.
 static bool add_name(GHashTable *names, const char *name) {
     return g_hash_table_add(names, const_cast<char *>(name)) == TRUE;
@@ -46,6 +58,7 @@ class line_review {
     ~line_review() {
         g_hash_table_unref(shadowed_);
         g_hash_table_unref(due_);
+        g_ptr_array_unref(kept_);
         g_hash_table_unref(users_);
         g_hash_table_unref(shadow_names_);
     }
@@ -64,8 +77,6 @@ class line_review {
     void review_added_shadow_lines();
     void review_order();
     void review_groups();
-    void expect_shadow_line(const internal_user *user);
-    bool take_shadow_line(const char *name);
     void explain_lost_user(const account_line &line);
     void explain_lost_group(const account_line &line);
     void compare(int row, const account_line &line, const void *record);
@@ -80,6 +91,7 @@ class line_review {
     // have the same line), and how many lines are to come.
     GHashTable *shadowed_ = name_table_new();
     GHashTable *due_ = name_table_new();
+    GPtrArray *kept_ = g_ptr_array_new();   // the names of the lines that are there already
     GHashTable *users_ = name_table_new();  // those with a line in passwd
     GHashTable *shadow_names_ = name_table_new();
 };
@@ -193,8 +205,9 @@ void line_review::explain_lost_user(const account_line &line) {
         line.field(PASSWORD) == ELSEWHERE && !has_name(shadow_names_, line.name);
     if (lacks_shadow_line && is_unfinished_addition(files_, line))
         add(gravity::CHANGE, "unfinished-addition", ROW, line,
-            g_strdup("a write drops this line: the user's addition was cut off before there was a "
-                     "line in the shadow file, and can be made again"));
+            g_strdup(
+                "a write drops this line: by all that is left, the user's addition was cut off "
+                "before there was a line in the shadow file, and can be made again"));
     else if (lacks_shadow_line)
         add(gravity::LOSS, "no-shadow-line", ROW, line,
             g_strdup("a write drops the user: its password is in the shadow file, which has no "
@@ -254,28 +267,13 @@ void line_review::review_passwd() {
             explain_lost_user(*line);
             continue;
         }
-        if (user->shadowed)
-            expect_shadow_line(user);
+        if (user->shadowed) {
+            (void)g_hash_table_insert(shadowed_, user->name, const_cast<internal_user *>(user));
+            count_one(due_, user->name);
+        }
         compare(CORE_FILE_ROW_PASSWD, *line, user);
         review_hash(CORE_FILE_ROW_PASSWD, *line);
     }
-}
-
-void line_review::expect_shadow_line(const internal_user *user) {
-    const guint due = GPOINTER_TO_UINT(g_hash_table_lookup(due_, user->name));
-
-    (void)g_hash_table_insert(shadowed_, user->name, const_cast<internal_user *>(user));
-    (void)g_hash_table_insert(due_, user->name, GUINT_TO_POINTER(due + 1));
-}
-
-// False where all that are to come were taken.
-bool line_review::take_shadow_line(const char *name) {
-    const guint due = GPOINTER_TO_UINT(g_hash_table_lookup(due_, name));
-
-    if (due == 0)
-        return false;
-    (void)g_hash_table_insert(due_, const_cast<char *>(name), GUINT_TO_POINTER(due - 1));
-    return true;
 }
 
 void line_review::review_shadow() {
@@ -286,7 +284,8 @@ void line_review::review_shadow() {
         if (!line->is_entry)
             continue;
         const bool is_first = add_name(seen, line->name);
-        if (take_shadow_line(line->name)) {
+        if (take_one(due_, line->name)) {
+            g_ptr_array_add(kept_, line->name);
             compare(ROW, *line, g_hash_table_lookup(shadowed_, line->name));
             review_hash(ROW, *line);
         } else if (!is_first) {
@@ -306,7 +305,7 @@ void line_review::review_shadow() {
 // Each user of a name that stands twice is written with a line of its own.
 void line_review::review_added_shadow_lines() {
     for (const internal_user *user : records<const internal_user>(ctx_->user_db.entries))
-        if (user->shadowed && take_shadow_line(user->name))
+        if (user->shadowed && take_one(due_, user->name))
             out_->add(gravity::CHANGE, "added-shadow-line",
                       core_file_table[CORE_FILE_ROW_SHADOW].path, 0, user->name,
                       g_strdup("a write adds a line of the user, whose name stands twice in "
@@ -315,23 +314,16 @@ void line_review::review_added_shadow_lines() {
 
 // The lines of the shadow file follow those of passwd once they are written.
 void line_review::review_order() {
-    g_autoptr(GHashTable) before = name_table_new();
-    g_autoptr(GHashTable) after = name_table_new();
-    g_autoptr(GPtrArray) names = g_ptr_array_new();
+    g_autoptr(GHashTable) counts = name_table_new();
     guint at = 0;
     bool is_same = true;
 
-    for (const account_line *line : lines_of(files_[CORE_FILE_ROW_SHADOW]))
-        if (line->is_entry && has_name(shadowed_, line->name) && add_name(before, line->name))
-            g_ptr_array_add(names, line->name);
-    for (const internal_user *user : records<const internal_user>(ctx_->user_db.entries)) {
-        if (!user->shadowed || !add_name(after, user->name))
-            continue;
-        is_same = is_same && at < names->len &&
-                  std::strcmp(static_cast<const char *>(names->pdata[at]), user->name) == 0;
-        at++;
-    }
-    if (!is_same || at != names->len)
+    for (const char *name : records<const char>(kept_))
+        count_one(counts, name);
+    for (const internal_user *user : records<const internal_user>(ctx_->user_db.entries))
+        if (user->shadowed && take_one(counts, user->name))
+            is_same = is_same && g_str_equal(kept_->pdata[at++], user->name);
+    if (!is_same)
         out_->add(gravity::CHANGE, "order", core_file_table[CORE_FILE_ROW_SHADOW].path, 0, nullptr,
                   g_strdup("its lines stand in another order than those of passwd, which a write "
                            "gives them"));

@@ -18,6 +18,33 @@ static bool has_temporary_file() {
     return false;
 }
 
+// An addition appends the user, whose name and UID nobody had.
+static bool is_last_and_new(const account_file &passwd, const account_line &user) {
+    for (const account_line *line : lines_of(passwd)) {
+        if (line == &user)
+            return line == passwd.lines->pdata[passwd.lines->len - 1];
+        if (line->is_entry && (g_str_equal(line->name, user.name) || line->id == user.id))
+            return false;
+    }
+    return false;
+}
+
+static bool is_given_by_a_method(guint32 uid) {
+    const guint32 type = user_type_of_uid(uid);
+    return type == USER_TYPE_DYNAMIC_SYSTEM || type == USER_TYPE_ORNET;
+}
+
+// Also one that is no entry, of which somebody may make one again.
+static bool has_line(const account_file &shadow, std::string_view name) {
+    for (const account_line *line : lines_of(shadow)) {
+        const std::string_view field = line->field(0);
+        const std::size_t start = field.find_first_not_of(" \t");
+        if (start != std::string_view::npos && field.substr(start) == name)
+            return true;
+    }
+    return false;
+}
+
 static bool is_listed(const account_file &groups, const char *user) {
     for (const account_line *line : lines_of(groups)) {
         if (!line->is_entry)
@@ -31,11 +58,10 @@ static bool is_listed(const account_file &groups, const char *user) {
 
 bool is_unfinished_addition(const account_file (&files)[CORE_FILE_COUNT],
                             const account_line &user) {
-    const GPtrArray *lines = files[CORE_FILE_ROW_PASSWD].lines;
-    const guint32 type = user_type_of_uid(user.id);
+    const account_file &shadow = files[CORE_FILE_ROW_SHADOW];
 
-    // An addition appends the user, who joins a group only with the last of the three files.
-    return lines->pdata[lines->len - 1] == &user &&
-           (type == USER_TYPE_DYNAMIC_SYSTEM || type == USER_TYPE_ORNET) &&
+    // The lines in shadow and group come with the files that were not replaced any more.
+    return is_last_and_new(files[CORE_FILE_ROW_PASSWD], user) && is_given_by_a_method(user.id) &&
+           shadow.lines != nullptr && !has_line(shadow, user.name) &&
            !is_listed(files[CORE_FILE_ROW_GROUP], user.name) && has_temporary_file();
 }

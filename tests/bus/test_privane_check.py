@@ -214,6 +214,21 @@ def test_a_name_that_stands_twice_in_both_files() -> None:
         "in an earlier one, which counts"]
 
 
+def test_the_order_of_a_name_that_stands_twice() -> None:
+    order = "/etc/shadow: change: order: its lines stand in another order than those of passwd, which a write " \
+            "gives them"
+    passwd = GOOD_PASSWD + "bob:x:1002:100::/:/bin/sh\nalice:x:1003:100::/:/bin/sh\n"
+    twice = TWICE.replace(":3:", ":4:")
+    bobs = ALICES_LINE.replace("alice", "bob")
+    write(passwd, GOOD_SHADOW + ALICES_LINE + bobs)
+    done = check()
+    assert (done.stdout.splitlines(), done.returncode) == ([twice, order], CHANGES)
+    write(passwd, GOOD_SHADOW + bobs + ALICES_LINE)
+    assert told() == [twice]
+    write(passwd, GOOD_SHADOW + bobs)
+    assert [line.split(": ")[2] for line in told()] == ["repeated-name", "added-shadow-line"]
+
+
 def test_a_shadow_line_is_of_the_name_that_needs_it() -> None:
     """The last of two has its password in passwd."""
     write(GOOD_PASSWD + "alice:*:1002:100::/:/bin/sh\n")

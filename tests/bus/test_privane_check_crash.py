@@ -9,12 +9,13 @@ from harness.accounts import GROUP, PASSWD, SHADOW, AccountFiles
 from harness.checker import (CHANGES, GOOD_GROUP, GOOD_PASSWD, GOOD_SHADOW, LOSS, NOTHING, check,
                              write)
 
-WEB, SYSTEM = "bob:x:1002:100::/home:/bin/false\n", "bob:x:998:100::/home:/bin/false\n"
+WEB = "bob:x:1002:100::/home:/bin/false\n"
 HASH = "bob:$5$salt$hash:19000:0:99999:7:0::\n"
 NEW_GROUP = GOOD_GROUP.replace("alice", "alice,bob")
 
-UNFINISHED = ("/etc/passwd:3: change: unfinished-addition: 'bob': a write drops this line: the user's "
-              "addition was cut off before there was a line in the shadow file, and can be made again\n")
+UNFINISHED = ("/etc/passwd:3: change: unfinished-addition: 'bob': a write drops this line: by all that is "
+              "left, the user's addition was cut off before there was a line in the shadow file, and can be "
+              "made again\n")
 LOST = ("loss: no-shadow-line: 'bob': a write drops the user: its password is in the shadow file, which "
         "has no line of it\n")
 
@@ -36,7 +37,16 @@ def leftovers(accounts: AccountFiles) -> Iterator[Callable[..., None]]:
     make()
 
 
-@pytest.mark.parametrize("line", (WEB, SYSTEM))
+# The UIDs that methods give, and those next to them.
+GIVEN = (500, 998, 1000, 60000)
+NOT_GIVEN = (499, 60001, 65534)
+
+
+def with_uid(uid: int) -> str:
+    return WEB.replace("1002", str(uid))
+
+
+@pytest.mark.parametrize("line", map(with_uid, GIVEN))
 def test_an_addition_that_was_cut_off_after_passwd(line: str, leftovers: Callable[..., None]) -> None:
     write(GOOD_PASSWD + line)
     leftovers(shadow=GOOD_SHADOW + HASH, group=NEW_GROUP)
@@ -57,6 +67,7 @@ LATER = {
     "group is begun": {"passwd": GOOD_PASSWD, "shadow": GOOD_SHADOW, "group": ""},
     "the addition again": {"passwd": GOOD_PASSWD + WEB, "shadow": GOOD_SHADOW + HASH, "group": ""},
     "passwd is removed again": {"group": GOOD_GROUP},
+    "shadow is removed after a change of a group": {"passwd": GOOD_PASSWD},
 }
 
 
@@ -74,28 +85,40 @@ def test_without_a_leftover_the_user_is_lost() -> None:
     assert (guard.stdout, guard.returncode) == (f"/etc/passwd:3: {LOST}", LOSS)
 
 
-# passwd and group.
+# passwd, shadow and group, and the line of passwd.
 NO_ADDITIONS = {
-    "not the last": (GOOD_PASSWD + WEB + "carol:*:1003:100::/:/bin/sh\n", GOOD_GROUP),
-    "a password that moves to shadow": (GOOD_PASSWD + WEB, NEW_GROUP),
-    "a UID that no method gives": (GOOD_PASSWD + WEB.replace("1002", "499"), GOOD_GROUP),
+    "not the last": (GOOD_PASSWD + WEB + "carol:*:1003:100::/:/bin/sh\n", GOOD_SHADOW, GOOD_GROUP, 3),
+    "a password that moves to shadow": (GOOD_PASSWD + WEB, GOOD_SHADOW, NEW_GROUP, 3),
+    "a name that stands twice": (GOOD_PASSWD + WEB.replace("x:1002", "*:1003") + WEB, GOOD_SHADOW,
+                                 GOOD_GROUP, 4),
+    "a UID that stands twice": (GOOD_PASSWD + with_uid(1001), GOOD_SHADOW, GOOD_GROUP, 3),
+    "a malformed shadow line": (GOOD_PASSWD + WEB, GOOD_SHADOW + HASH.replace("99999", "many"), GOOD_GROUP,
+                                3),
+    "a shadow line that is cut": (GOOD_PASSWD + WEB, GOOD_SHADOW + " bob:$5$sa", GOOD_GROUP, 3),
+    "no shadow file": (GOOD_PASSWD.replace(":x:", ":*:") + WEB, None, GOOD_GROUP, 3),
+    **{f"UID {uid}": (GOOD_PASSWD + with_uid(uid), GOOD_SHADOW, GOOD_GROUP, 3) for uid in NOT_GIVEN},
 }
 
 
 @pytest.mark.parametrize("case", NO_ADDITIONS)
 def test_an_account_that_was_there_is_lost(case: str, leftovers: Callable[..., None]) -> None:
-    passwd, group = NO_ADDITIONS[case]
-    write(passwd, group=group)
+    passwd, shadow, group, number = NO_ADDITIONS[case]
+    write(passwd, shadow, group)
     leftovers(shadow=GOOD_SHADOW + HASH, group=NEW_GROUP)
     guard = check("--guard")
-    assert (guard.stdout, guard.returncode) == (f"/etc/passwd:3: {LOST}", LOSS)
+    assert (guard.stdout, guard.returncode) == (f"/etc/passwd:{number}: {LOST}", LOSS)
 
 
-def test_what_is_no_file_is_no_leftover(leftovers: Callable[..., None]) -> None:
+@pytest.mark.parametrize("make", (Path.mkdir, lambda path: path.symlink_to("/etc/passwd")))
+def test_what_is_no_file_is_no_leftover(make: Callable[[Path], None]) -> None:
     write(GOOD_PASSWD + WEB)
-    for path in (PASSWD, SHADOW, GROUP):
-        temporary(path).mkdir()
+    made = [temporary(path) for path in (PASSWD, SHADOW, GROUP)]
+    for path in made:
+        make(path)
     guard = check("--guard")
-    for path in (PASSWD, SHADOW, GROUP):
-        temporary(path).rmdir()
+    for path in made:
+        if path.is_symlink():
+            path.unlink()
+        else:
+            path.rmdir()
     assert guard.returncode == LOSS

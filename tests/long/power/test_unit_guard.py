@@ -26,6 +26,5 @@ def test_an_account_in_part_is_one_that_is_just_made(guard: UnitGuard) -> None:
     (fault,) = guard.faults(LEFT, {})
     assert fault.startswith("the unit would not start the service: status 3: ")
     assert "no-shadow-line: 'anna'" in fault
-    # The same once more, without another start of the program.
     assert guard.faults(LEFT, {}) == [fault]
     assert guard.faults(LEFT, temporaries) == []
