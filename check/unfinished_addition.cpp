@@ -35,14 +35,14 @@ static bool is_given_by_a_method(guint32 uid) {
 }
 
 // Also one that is no entry, of which somebody may make one again.
-static bool has_line(const account_file &shadow, std::string_view name) {
+static const account_line *find_line(const account_file &shadow, std::string_view name) {
     for (const account_line *line : lines_of(shadow)) {
         const std::string_view field = line->field(0);
         const std::size_t start = field.find_first_not_of(" \t");
         if (start != std::string_view::npos && field.substr(start) == name)
-            return true;
+            return line;
     }
-    return false;
+    return nullptr;
 }
 
 static bool is_listed(const account_file &groups, const char *user) {
@@ -62,6 +62,6 @@ bool is_unfinished_addition(const account_file (&files)[CORE_FILE_COUNT],
 
     // The lines in shadow and group come with the files that were not replaced any more.
     return is_last_and_new(files[CORE_FILE_ROW_PASSWD], user) && is_given_by_a_method(user.id) &&
-           shadow.lines != nullptr && !has_line(shadow, user.name) &&
+           shadow.lines != nullptr && find_line(shadow, user.name) == nullptr &&
            !is_listed(files[CORE_FILE_ROW_GROUP], user.name) && has_temporary_file();
 }
